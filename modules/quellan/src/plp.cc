@@ -1,0 +1,335 @@
+#include "plp.h"
+
+#include <algorithm>
+#include <cmath>
+#include <cstring>
+#include <limits>
+#include <new>
+#include <stdexcept>
+
+#include "quellan_log.h"
+
+namespace {
+
+constexpr double kPreEmphasis = 0.97;
+constexpr float kStaticScale = 10.0f;
+constexpr float kStaticClip = 50.0f;
+constexpr int kDeltaWindowFrames = 2;
+constexpr float kDeltaDivisor = 10.0f;  // 2 * (1^2 + 2^2)
+constexpr float kFilterbankFloor = 1.0f;
+constexpr double kMinStdDev = 0.01;
+constexpr uint16_t kOutsideBand = 65535;
+
+double mel(double hz) { return 1127.0 * std::log(1.0 + hz / 700.0); }
+
+float clip_static(float v) {
+  return v > kStaticClip ? kStaticClip : (v < -kStaticClip ? -kStaticClip : v);
+}
+
+}  // namespace
+
+PLP::PLP(const PlpConfig* conf, FILE* cmsfp) {
+  if (load_base_info_cmsfp(this, conf, cmsfp) != 0) {
+    QUELLAN_WARN("Failed to load base info\n");
+    throw std::runtime_error("init vad failed");
+  }
+  build_tables();
+  const size_t tgt_floats =
+      static_cast<size_t>(conf_.feat_dim) * conf_.max_frame_num;
+  m_tgt_.reset(new (std::nothrow) float[tgt_floats]());
+  if (!m_tgt_) {
+    QUELLAN_WARN("Failed to alloc memory for m_tgt, size[%lu]\n",
+                 static_cast<unsigned long>(tgt_floats * sizeof(float)));
+    throw std::runtime_error("init vad failed");
+  }
+  const size_t static_floats =
+      static_cast<size_t>(static_dim_) * conf_.max_frame_num;
+  static_buf_.reset(new (std::nothrow) float[static_floats]());
+  if (!static_buf_) {
+    QUELLAN_WARN("Failed to alloc memory for m_tgt, size[%lu]\n",
+                 static_cast<unsigned long>(static_floats * sizeof(float)));
+    throw std::runtime_error("init vad failed");
+  }
+}
+
+int PLP::delay_frames() const {
+  return kDeltaWindowFrames * (conf_.feat_dim / static_dim_ - 1);
+}
+
+void PLP::build_tables() {
+  fft_n_ = 2;
+  while (fft_n_ < frame_size_) fft_n_ *= 2;
+  const int half_n = fft_n_ / 2;
+  const int num_chans = conf_.num_chans;
+
+  const double bin_mel_step = 1e7 / (conf_.src_period * fft_n_ * 700.0);
+  double mlo = 0.0;
+  first_bin_ = 2;
+  if (conf_.lo_freq >= 0.0f) {
+    mlo = mel(conf_.lo_freq);
+    first_bin_ = static_cast<int>(conf_.lo_freq * conf_.src_period * 1e-7 *
+                                      fft_n_ + 0.5);
+    if (first_bin_ < 2) first_bin_ = 2;
+  }
+  double mhi = mel(0.5e7 / conf_.src_period);
+  last_bin_ = half_n;
+  if (conf_.hi_freq >= 0.0f) {
+    mhi = mel(conf_.hi_freq);
+    last_bin_ = static_cast<int>(conf_.hi_freq * conf_.src_period * 1e-7 *
+                                     fft_n_ + 0.5);
+    if (last_bin_ > half_n) last_bin_ = half_n;
+  }
+
+  std::vector<double> centre(num_chans + 2);
+  centre[0] = mlo;
+  for (int i = 1; i <= num_chans + 1; ++i) {
+    centre[i] = static_cast<double>(i) / (num_chans + 1) * (mhi - mlo) + mlo;
+  }
+  bin_chan_.assign(half_n + 1, kOutsideBand);
+  bin_weight_.assign(half_n + 1, 0.0f);
+  for (int k = 1; k <= half_n; ++k) {
+    if (k < first_bin_ || k > last_bin_) continue;
+    const double m = 1127.0 * std::log(1.0 + (k - 1) * bin_mel_step);
+    int ch = 0;
+    while (ch + 1 <= num_chans + 1 && centre[ch + 1] < m) ++ch;
+    bin_chan_[k] = static_cast<uint16_t>(ch);
+    bin_weight_[k] = static_cast<float>((centre[ch + 1] - m) /
+                                        (centre[ch + 1] - centre[ch]));
+  }
+
+  loudness_.assign(num_chans + 1, 0.0f);
+  for (int j = 1; j <= num_chans; ++j) {
+    const double f = 700.0 * (std::exp(centre[j] / 1127.0) - 1.0);
+    const double s = f * f;
+    const double ratio = s / (s + 1.6e5);
+    loudness_[j] =
+        static_cast<float>(ratio * ratio * (s + 1.44e6) / (s + 9.61e6));
+  }
+
+  const int n_freq = num_chans + 2;
+  idft_cos_.assign(conf_.lpc_order + 1, std::vector<double>(n_freq + 1, 0.0));
+  for (int k = 0; k <= conf_.lpc_order; ++k) {
+    std::vector<double>& row = idft_cos_[k];
+    const double step = k * M_PI / (n_freq - 1);
+    row[1] = 1.0;
+    for (int j = 1; j <= n_freq - 2; ++j) row[j + 1] = 2.0 * std::cos(j * step);
+    row[n_freq] = std::cos((n_freq - 1) * step);
+  }
+
+  lifter_.assign(conf_.num_ceps + 1, 1.0f);
+  if (conf_.cep_lifter > 0) {
+    const double len = conf_.cep_lifter;
+    for (int i = 1; i <= conf_.num_ceps; ++i) {
+      lifter_[i] = static_cast<float>(1.0 + len / 2.0 * std::sin(M_PI * i / len));
+    }
+  }
+  hamming_.assign(frame_size_ + 1, 0.0f);
+  for (int i = 1; i <= frame_size_; ++i) {
+    hamming_[i] = static_cast<float>(
+        0.54 - 0.46 * std::cos(2.0 * M_PI * (i - 1) / (frame_size_ - 1)));
+  }
+
+  fft_ = std::make_unique<RealFft>(fft_n_);
+  frame_.assign(fft_n_ + 1, 0.0f);
+  spectrum_.assign(half_n + 1, 0.0f);
+  fbank_.assign(num_chans + 1, 0.0f);
+  aud_spec_.assign(n_freq + 1, 0.0f);
+  ac_.assign(conf_.lpc_order + 2, 0.0f);
+  lp_.assign(conf_.lpc_order + 2, 0.0f);
+  durbin_scratch_.assign(conf_.lpc_order + 2, 0.0f);
+  cep_.assign(static_dim_ + 1, 0.0f);
+}
+
+int PLP::AddWaveData(const int16_t* waveData, int smpNum) {
+  if (m_bInitialize_ != 1 || waveData == nullptr || smpNum <= 0) {
+    QUELLAN_WARN("Null m_bInitialize[%lx] or waveData[%p] or smpNum[%d]\n",
+                 static_cast<unsigned long>(m_bInitialize_),
+                 static_cast<const void*>(waveData), smpNum);
+    return -1;
+  }
+  frame_num_ = (smpNum - frame_size_) / frame_shift_ + 1;
+  if (frame_num_ >= conf_.max_frame_num) {
+    QUELLAN_WARN("Too many frames[%d] >= max_frame_num[%d]\n", frame_num_,
+                 conf_.max_frame_num);
+    return -1;
+  }
+  // The mean is removed from the copy of each frame, not from the caller's
+  // block, which the pipeline keeps as overlap for the next block.
+  double mean = 0.0;
+  if (conf_.zero_mean_src) {
+    for (int i = 0; i < smpNum; ++i) mean += waveData[i];
+    mean /= smpNum;
+  }
+  for (int t = 0; t < frame_num_; ++t) {
+    const int16_t* samples = waveData + static_cast<size_t>(t) * frame_shift_;
+    for (int i = 0; i < frame_size_; ++i) {
+      if (conf_.zero_mean_src) {
+        const double centred = std::round(samples[i] - mean);
+        frame_[i + 1] = static_cast<float>(std::clamp(centred, -32767.0, 32767.0));
+      } else {
+        frame_[i + 1] = samples[i];
+      }
+    }
+    analyse_frame(static_buf_.get() + static_cast<size_t>(t) * static_dim_);
+  }
+  return 0;
+}
+
+void PLP::analyse_frame(float* cepstrum) {
+  float* x = frame_.data();
+  for (int i = frame_size_; i >= 2; --i) {
+    x[i] = static_cast<float>(x[i] - kPreEmphasis * x[i - 1]);
+  }
+  x[1] = static_cast<float>(x[1] * (1.0 - kPreEmphasis));
+  for (int i = 1; i <= frame_size_; ++i) x[i] *= hamming_[i];
+  // spectrum_[k - 1] is the magnitude of filterbank bin k.
+  fft_->magnitude(x + 1, spectrum_.data());
+
+  const int num_chans = conf_.num_chans;
+  std::fill(fbank_.begin(), fbank_.end(), 0.0f);
+  for (int k = first_bin_; k <= last_bin_; ++k) {
+    const float e = spectrum_[k - 1];
+    const int ch = bin_chan_[k];
+    const float w = bin_weight_[k] * e;
+    if (ch > 0) fbank_[ch] += w;
+    if (ch < num_chans) fbank_[ch + 1] += e - w;
+  }
+
+  const int n_freq = num_chans + 2;
+  for (int j = 1; j <= num_chans; ++j) {
+    const float band = std::max(fbank_[j], kFilterbankFloor);
+    aud_spec_[j + 1] = static_cast<float>(
+        std::pow(static_cast<double>(band * loudness_[j]), conf_.compress_fact));
+  }
+  aud_spec_[1] = aud_spec_[2];
+  aud_spec_[n_freq] = aud_spec_[n_freq - 1];
+
+  float energy = 0.0f;
+  for (int k = 0; k <= conf_.lpc_order; ++k) {
+    double sum = 0.0;
+    for (int i = 1; i <= n_freq; ++i) sum += aud_spec_[i] * idft_cos_[k][i];
+    const float r = static_cast<float>(sum / (2.0 * (n_freq - 1)));
+    if (k == 0) {
+      energy = r;
+    } else {
+      ac_[k] = r;
+    }
+  }
+  lp_[conf_.lpc_order + 1] = 0.0f;
+  const float err = durbin(energy);
+
+  float* c = cep_.data();
+  for (int n = 1; n <= static_dim_; ++n) {
+    float sum = 0.0f;
+    for (int i = 1; i < n; ++i) sum += (n - i) * lp_[i] * c[n - i];
+    c[n] = -(lp_[n] + sum / n);
+  }
+  if (tgt_kind_ & kTargetKindC0) {
+    // A vanishing prediction error drives C0 to the clip floor rather than
+    // to a NaN that would poison the running statistics.
+    c[static_dim_] = err > 0.0f
+                         ? static_cast<float>(-std::log(1.0 / err))
+                         : -std::numeric_limits<float>::infinity();
+  }
+  if (conf_.cep_lifter > 0) {
+    for (int i = 1; i <= conf_.num_ceps; ++i) c[i] *= lifter_[i];
+  }
+  std::memcpy(cepstrum, c + 1, sizeof(float) * static_dim_);
+}
+
+float PLP::durbin(float energy) {
+  const int order = conf_.lpc_order;
+  float* a = lp_.data();
+  float* next = durbin_scratch_.data();
+  float err = energy;
+  for (int i = 1; i <= order; ++i) {
+    float k = ac_[i];
+    for (int j = 1; j < i; ++j) k += a[j] * ac_[i - j];
+    k /= err;
+    err *= 1.0f - k * k;
+    next[i] = -k;
+    for (int j = 1; j < i; ++j) next[j] = a[j] - k * a[i - j];
+    for (int j = 1; j <= i; ++j) a[j] = next[j];
+  }
+  return err;
+}
+
+int PLP::extract_feature(const int16_t* wave, int smpNum, float* out,
+                         int max_out_frames, int* out_frames, int flag) {
+  if (AddWaveData(wave, smpNum) != 0) {
+    QUELLAN_WARN("Failed to add wave data.\n");
+    return -1;
+  }
+  const int frames = frame_num_;
+  const int feat_dim = conf_.feat_dim;
+  for (int t = 0; t < frames; ++t) {
+    const float* src = static_buf_.get() + static_cast<size_t>(t) * static_dim_;
+    float* dst = m_tgt_.get() + static_cast<size_t>(t) * feat_dim;
+    for (int i = 0; i < static_dim_; ++i) dst[i] = clip_static(src[i] * kStaticScale);
+  }
+  add_derivatives(frames);
+  if (feat_dim / static_dim_ >= 2) {
+    if ((flag == -1 && smpNum <= conf_.online_max_samples) ||
+        conf_.cms_mode == 0) {
+      normalise_block(frames);
+    } else {
+      normalise_running(frames, flag);
+    }
+  }
+  if (frames >= max_out_frames) {
+    QUELLAN_WARN("Too many frames.\n");
+    return -1;
+  }
+  const int stride = feat_dim + conf_.out_pad;
+  for (int t = 0; t < frames; ++t) {
+    std::memcpy(out + static_cast<size_t>(t) * stride,
+                m_tgt_.get() + static_cast<size_t>(t) * feat_dim,
+                sizeof(float) * feat_dim);
+  }
+  *out_frames = frames;
+  return 0;
+}
+
+void PLP::add_derivatives(int frames) {
+  const int feat_dim = conf_.feat_dim;
+  const int blocks = feat_dim / static_dim_;
+  for (int d = 0; d + 1 < blocks; ++d) {
+    const int src_col = d * static_dim_;
+    const int dst_col = (d + 1) * static_dim_;
+    for (int t = 0; t < frames; ++t) {
+      float* dst = m_tgt_.get() + static_cast<size_t>(t) * feat_dim + dst_col;
+      for (int i = 0; i < static_dim_; ++i) {
+        float sum = 0.0f;
+        for (int k = 1; k <= kDeltaWindowFrames; ++k) {
+          // Frames beyond the block edges repeat the edge frame.
+          const int ahead = std::min(t + k, frames - 1);
+          const int behind = std::max(t - k, 0);
+          sum += k * (m_tgt_[static_cast<size_t>(ahead) * feat_dim + src_col + i] -
+                      m_tgt_[static_cast<size_t>(behind) * feat_dim + src_col + i]);
+        }
+        dst[i] = sum / kDeltaDivisor;
+      }
+    }
+  }
+}
+
+void PLP::normalise_block(int frames) {
+  if (frames <= 0) return;
+  const int feat_dim = conf_.feat_dim;
+  const double divisor = frames < 2 ? 1.0 : frames - 1.0;
+  for (int i = 0; i < feat_dim; ++i) {
+    double sum = 0.0;
+    for (int t = 0; t < frames; ++t) sum += m_tgt_[static_cast<size_t>(t) * feat_dim + i];
+    const double mean = sum / frames;
+    double squares = 0.0;
+    for (int t = 0; t < frames; ++t) {
+      const double d = m_tgt_[static_cast<size_t>(t) * feat_dim + i] - mean;
+      squares += d * d;
+    }
+    const double sd = std::max(std::sqrt(squares / divisor), kMinStdDev);
+    for (int t = 0; t < frames; ++t) {
+      float& v = m_tgt_[static_cast<size_t>(t) * feat_dim + i];
+      v = static_cast<float>((v - mean) / sd);
+    }
+  }
+}

@@ -1,0 +1,24 @@
+// Magnitude spectrum of a real frame by an iterative radix-2 FFT.
+#ifndef QUELLAN_REAL_FFT_H_
+#define QUELLAN_REAL_FFT_H_
+
+#include <vector>
+
+class RealFft {
+ public:
+  // `fft_n` must be a power of two.
+  explicit RealFft(int fft_n);
+
+  // Reads `fft_n` samples and writes |X[k]| for k = 0 .. fft_n / 2.
+  void magnitude(const float* frame, float* magnitude);
+
+ private:
+  int fft_n_;
+  std::vector<double> re_;
+  std::vector<double> im_;
+  std::vector<double> cos_table_;
+  std::vector<double> sin_table_;
+  std::vector<int> bit_reverse_;
+};
+
+#endif  // QUELLAN_REAL_FFT_H_

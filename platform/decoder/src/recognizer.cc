@@ -1,0 +1,232 @@
+#include "recognizer.h"
+
+#include <pocketsphinx.h>
+#include <err.h>
+
+#include <algorithm>
+#include <mutex>
+#include <vector>
+
+#include "kvasr_decoder_constants.h"
+
+namespace kvasr::decoder {
+namespace {
+
+// The interface fixes the audio at 16 kHz.
+constexpr int64_t kSampleRateHz = 16000;
+constexpr int64_t kSamplesPerMs = kSampleRateHz / 1000;
+
+// PocketSphinx counts frames and samples of an utterance in 32-bit integers,
+// so a single chunk beyond that cannot be meant.
+constexpr int64_t kMaxChunkSamples = INT32_MAX;
+
+// The engine's own choice (5 s, 1 s) is also what a decoder gets before
+// anyone sets the limits.
+constexpr int32_t kDefaultLeadingSilenceMs = 5000;
+constexpr int32_t kDefaultTrailingSilenceMs = 1000;
+
+// PocketSphinx's log sink is one process-wide setting; builds of two
+// instances at once must not race on it.
+std::mutex log_setup_mutex;
+
+// Filler words (sentence marks, silence, noises) are written <...>, [...] or
+// ++...++ in the dictionaries PocketSphinx reads; they are not recognised
+// words and carry no confidence worth averaging.
+bool IsFillerWord(const char* word) {
+  return word[0] == '<' || word[0] == '[' || word[0] == '+';
+}
+
+bool IsKnownOption(const std::string& name) {
+  const std::string flag = "-" + name;
+  for (const arg_t* arg = ps_args(); arg->name != nullptr; ++arg) {
+    if (flag == arg->name) return true;
+  }
+  return false;
+}
+
+// Marks the recogniser busy in a callback, also when the callback throws.
+class CallbackScope {
+ public:
+  explicit CallbackScope(int* depth) : depth_(depth) { ++*depth_; }
+  ~CallbackScope() { --*depth_; }
+  CallbackScope(const CallbackScope&) = delete;
+  CallbackScope& operator=(const CallbackScope&) = delete;
+
+ private:
+  int* const depth_;
+};
+
+}  // namespace
+
+std::unique_ptr<Recognizer> Recognizer::Create(const ModelSettings& settings) {
+  std::vector<std::string> args = {"kvasr_decoder",
+                                   "-hmm", settings.acoustic_model_dir,
+                                   "-dict", settings.dictionary};
+  if (!settings.filler_dictionary.empty()) {
+    args.insert(args.end(), {"-fdict", settings.filler_dictionary});
+  }
+  if (!settings.language_model.empty()) {
+    args.insert(args.end(), {"-lm", settings.language_model});
+  } else {
+    args.insert(args.end(), {"-jsgf", settings.grammar});
+  }
+  for (const auto& [name, value] : settings.options) {
+    if (!IsKnownOption(name)) {
+      ReportError("unknown recogniser option \"" + name + "\" in the model manifest");
+      return nullptr;
+    }
+    args.insert(args.end(), {"-" + name, value});
+  }
+  std::vector<char*> argv;
+  for (std::string& arg : args) argv.push_back(arg.data());
+
+  std::lock_guard<std::mutex> lock(log_setup_mutex);
+  err_set_logfp(settings.log_to_stderr ? stderr : nullptr);
+  cmd_ln_t* config = cmd_ln_parse_r(nullptr, ps_args(), static_cast<int32>(argv.size()),
+                                    argv.data(), TRUE);
+  if (config == nullptr) {
+    ReportError("the recogniser rejected an option value in the model manifest");
+    return nullptr;
+  }
+  ps_decoder_t* ps = ps_init(config);
+  // The decoder keeps its own reference to the configuration.
+  cmd_ln_free_r(config);
+  if (ps == nullptr) {
+    ReportError("the recogniser could not load the model named in the manifest "
+                "(\"log = stderr\" in the manifest shows why)");
+    return nullptr;
+  }
+  cmd_ln_t* used = ps_get_config(ps);
+  const int32 frame_rate = cmd_ln_int32_r(used, "-frate");
+  const int32 hangover_frames = cmd_ln_int32_r(used, "-vad_postspeech");
+  if (frame_rate <= 0 || frame_rate > kSampleRateHz) {
+    ReportError("recogniser option frate must be between 1 and 16000");
+    ps_free(ps);
+    return nullptr;
+  }
+  const int64_t frame_shift_samples = kSampleRateHz / frame_rate;
+  return std::unique_ptr<Recognizer>(
+      new Recognizer(ps, frame_shift_samples, hangover_frames * frame_shift_samples));
+}
+
+Recognizer::Recognizer(ps_decoder_t* ps, int64_t frame_shift_samples,
+                       int64_t hangover_samples)
+    : ps_(ps), frame_shift_samples_(frame_shift_samples), detector_(hangover_samples) {
+  SetSpeechEndLimits(kDefaultLeadingSilenceMs, kDefaultTrailingSilenceMs);
+}
+
+Recognizer::~Recognizer() {
+  // An unfinished utterance is dropped without a result.
+  if (utterance_active_) ps_end_utt(ps_);
+  ps_free(ps_);
+}
+
+int Recognizer::SetSpeechEndLimits(int32_t leading_silence_ms, int32_t trailing_silence_ms) {
+  if (leading_silence_ms < 0 || trailing_silence_ms < 0) return KVASR_DECODER_ERR_ARGUMENT;
+  detector_.SetLimits(leading_silence_ms * kSamplesPerMs, trailing_silence_ms * kSamplesPerMs);
+  return 0;
+}
+
+int Recognizer::Start() {
+  if (InCallback()) return KVASR_DECODER_ERR_BUSY;
+  if (utterance_active_) {
+    // Starting over drops the unfinished utterance without a result, since
+    // results are delivered only from feeding and stopping.
+    ps_end_utt(ps_);
+    utterance_active_ = false;
+  }
+  return BeginUtterance();
+}
+
+int Recognizer::Feed(const int16_t* samples, int64_t count, bool last) {
+  if (count < 0 || count > kMaxChunkSamples || (count > 0 && samples == nullptr)) {
+    return KVASR_DECODER_ERR_ARGUMENT;
+  }
+  if (InCallback()) return KVASR_DECODER_ERR_BUSY;
+  for (int64_t done = 0; done < count;) {
+    // After an automatic stop the rest of the chunk opens the next utterance.
+    if (!utterance_active_) {
+      const int started = BeginUtterance();
+      if (started < 0) return started;
+    }
+    const int64_t piece = std::min(frame_shift_samples_, count - done);
+    if (ps_process_raw(ps_, samples + done, static_cast<size_t>(piece), FALSE, FALSE) < 0) {
+      return KVASR_DECODER_ERR_RECOGNISER;
+    }
+    done += piece;
+    if (!speech_end_enabled_) continue;
+    const int reason = detector_.Update(ps_get_in_speech(ps_) != 0, piece);
+    if (reason == 0) continue;
+    DeliverSpeechEnd(reason);
+    if (auto_stop_) FinishUtterance();
+    if (destroy_requested_) return 0;
+  }
+  if (!utterance_active_) return 0;
+  if (last) {
+    FinishUtterance();
+  } else {
+    DeliverPartial();
+  }
+  return 0;
+}
+
+int Recognizer::Stop() {
+  if (InCallback()) return KVASR_DECODER_ERR_BUSY;
+  if (utterance_active_) FinishUtterance();
+  return 0;
+}
+
+int Recognizer::BeginUtterance() {
+  if (ps_start_utt(ps_) < 0) return KVASR_DECODER_ERR_RECOGNISER;
+  utterance_active_ = true;
+  detector_.Reset();
+  last_partial_.clear();
+  return 0;
+}
+
+void Recognizer::FinishUtterance() {
+  utterance_active_ = false;
+  // A failed end still leaves the best hypothesis so far, and every
+  // utterance gets exactly one final result.
+  ps_end_utt(ps_);
+  int32 best_score;
+  const char* text = ps_get_hyp(ps_, &best_score);
+  if (text == nullptr) text = "";
+  DeliverResult(text, text[0] == '\0' ? 0.0f : MeanWordPosterior(), 1);
+}
+
+void Recognizer::DeliverPartial() {
+  int32 best_score;
+  const char* text = ps_get_hyp(ps_, &best_score);
+  if (text == nullptr || text[0] == '\0' || last_partial_ == text) return;
+  last_partial_ = text;
+  DeliverResult(text, KVASR_DECODER_SCORE_UNAVAILABLE, 0);
+}
+
+void Recognizer::DeliverResult(const char* text, float score, int flag) {
+  if (on_result_ == nullptr || destroy_requested_) return;
+  CallbackScope scope(&callback_depth_);
+  on_result_(text, score, flag, out_handle_);
+}
+
+void Recognizer::DeliverSpeechEnd(int reason) {
+  if (on_speech_end_ == nullptr || destroy_requested_) return;
+  CallbackScope scope(&callback_depth_);
+  on_speech_end_(reason, out_handle_);
+}
+
+float Recognizer::MeanWordPosterior() {
+  logmath_t* log_math = ps_get_logmath(ps_);
+  double sum = 0.0;
+  int words = 0;
+  // Iterating to the end frees the iterator.
+  for (ps_seg_t* seg = ps_seg_iter(ps_); seg != nullptr; seg = ps_seg_next(seg)) {
+    if (IsFillerWord(ps_seg_word(seg))) continue;
+    int32 acoustic_score, language_score, backoff;
+    sum += logmath_exp(log_math, ps_seg_prob(seg, &acoustic_score, &language_score, &backoff));
+    ++words;
+  }
+  return words == 0 ? 0.0f : static_cast<float>(sum / words);
+}
+
+}  // namespace kvasr::decoder

@@ -1,0 +1,194 @@
+#include "decoder_double.h"
+
+#include <deque>
+#include <map>
+#include <memory>
+
+#include "kvasr_decoder_api.h"
+
+#define DOUBLE_API extern "C"
+
+namespace decoder_double {
+namespace {
+
+struct Decoder {
+  void* out_handle = nullptr;
+  mw_result_callback on_result = nullptr;
+  mw_speech_end_callback on_speech_end = nullptr;
+};
+
+struct World {
+  std::vector<Call> calls;
+  std::map<void*, std::unique_ptr<Decoder>> decoders;
+  bool init_fails = false;
+  int start_result = 0;
+  std::deque<int> set_data_results;
+  std::deque<std::vector<Event>> on_set_data;
+  std::deque<std::vector<Event>> on_stop;
+  const char* version = "decoder-double 1.0";
+};
+
+World& world() {
+  static World w;
+  return w;
+}
+
+Decoder* Find(void* handle) {
+  auto it = world().decoders.find(handle);
+  return it == world().decoders.end() ? nullptr : it->second.get();
+}
+
+Call& Record(const std::string& name, std::vector<int64_t> args = {}) {
+  world().calls.push_back(Call{name, std::move(args), {}, false, {}});
+  return world().calls.back();
+}
+
+void Fire(void* handle, std::deque<std::vector<Event>>& queue) {
+  if (queue.empty()) return;
+  std::vector<Event> batch = std::move(queue.front());
+  queue.pop_front();
+  Decoder* d = Find(handle);
+  if (!d) return;
+  for (const Event& e : batch) {
+    if (e.kind == Event::kResult && d->on_result) {
+      d->on_result(e.null_text ? nullptr : e.text.c_str(), e.score, e.flag, d->out_handle);
+    } else if (e.kind == Event::kSpeechEnd && d->on_speech_end) {
+      d->on_speech_end(0, d->out_handle);
+    }
+  }
+}
+
+}  // namespace
+
+void Reset() {
+  World& w = world();
+  w.calls.clear();
+  w.decoders.clear();
+  w.init_fails = false;
+  w.start_result = 0;
+  w.set_data_results.clear();
+  w.on_set_data.clear();
+  w.on_stop.clear();
+  w.version = "decoder-double 1.0";
+}
+
+void ClearCalls() { world().calls.clear(); }
+
+const std::vector<Call>& Calls() { return world().calls; }
+
+std::vector<std::string> CallNames() {
+  std::vector<std::string> names;
+  for (const Call& c : world().calls) names.push_back(c.name);
+  return names;
+}
+
+int Count(const std::string& name) {
+  int n = 0;
+  for (const Call& c : world().calls) n += c.name == name;
+  return n;
+}
+
+int LiveDecoders() { return static_cast<int>(world().decoders.size()); }
+void SetInitFails(bool fails) { world().init_fails = fails; }
+void SetStartResult(int result) { world().start_result = result; }
+void QueueSetDataResult(int result) { world().set_data_results.push_back(result); }
+void SetVersion(const char* version) { world().version = version; }
+void QueueOnSetData(std::vector<Event> batch) { world().on_set_data.push_back(std::move(batch)); }
+void QueueOnStop(std::vector<Event> batch) { world().on_stop.push_back(std::move(batch)); }
+
+Event Result(const std::string& text, int flag, float score) {
+  Event e;
+  e.text = text;
+  e.flag = flag;
+  e.score = score;
+  return e;
+}
+
+Event SpeechEnd() {
+  Event e;
+  e.kind = Event::kSpeechEnd;
+  return e;
+}
+
+}  // namespace decoder_double
+
+using namespace decoder_double;
+
+DOUBLE_API void* mwDecoderInit(FILE* model_file, int reserved, int lang_flag) {
+  Call& call = Record("mwDecoderInit", {reserved, lang_flag});
+  char buffer[256];
+  size_t n;
+  while (model_file && (n = fread(buffer, 1, sizeof buffer, model_file)) > 0) call.model.append(buffer, n);
+  if (world().init_fails) return nullptr;
+  auto decoder = std::make_unique<Decoder>();
+  void* handle = decoder.get();
+  world().decoders[handle] = std::move(decoder);
+  return handle;
+}
+
+DOUBLE_API void mwDecoderDestroy(void* decoder) {
+  Record("mwDecoderDestroy");
+  world().decoders.erase(decoder);
+}
+
+DOUBLE_API int mwSetVadEnabled(void*, int enabled) {
+  Record("mwSetVadEnabled", {enabled});
+  return 0;
+}
+
+DOUBLE_API int mwSetAutoStopEnabled(void*, int enabled) {
+  Record("mwSetAutoStopEnabled", {enabled});
+  return 0;
+}
+
+DOUBLE_API int mwSetVadThreshold(void*, int32_t first, int32_t second) {
+  Record("mwSetVadThreshold", {first, second});
+  return 0;
+}
+
+DOUBLE_API int mwSetOutHandle(void* decoder, void* out_handle) {
+  Record("mwSetOutHandle");
+  if (Decoder* d = Find(decoder)) d->out_handle = out_handle;
+  return 0;
+}
+
+DOUBLE_API int mwSetOnSpeechEnd(void* decoder, mw_speech_end_callback callback) {
+  Record("mwSetOnSpeechEnd");
+  if (Decoder* d = Find(decoder)) d->on_speech_end = callback;
+  return 0;
+}
+
+DOUBLE_API int mwSetOnResult(void* decoder, mw_result_callback callback) {
+  Record("mwSetOnResult");
+  if (Decoder* d = Find(decoder)) d->on_result = callback;
+  return 0;
+}
+
+DOUBLE_API int mwStartDecode(void*) {
+  Record("mwStartDecode");
+  return world().start_result;
+}
+
+DOUBLE_API int mwSetData(void* decoder, const int16_t* samples, int64_t count, int last) {
+  Call& call = Record("mwSetData", {count, last});
+  call.null_samples = samples == nullptr;
+  if (samples && count > 0) call.samples.assign(samples, samples + count);
+  int result = 0;
+  if (!world().set_data_results.empty()) {
+    result = world().set_data_results.front();
+    world().set_data_results.pop_front();
+  }
+  Fire(decoder, world().on_set_data);
+  return result;
+}
+
+DOUBLE_API int mwStopDecode(void* decoder) {
+  Record("mwStopDecode");
+  Fire(decoder, world().on_stop);
+  return 0;
+}
+
+DOUBLE_API const char* mwGetVersion(void) {
+  Record("mwGetVersion");
+  return world().version;
+}

@@ -1,0 +1,89 @@
+#include "punctuator_double.h"
+
+#include <algorithm>
+#include <cstring>
+#include <deque>
+#include <set>
+
+#include "kvasr_punctuator_api.h"
+
+namespace punctuator_double {
+namespace {
+
+struct World {
+  std::vector<Call> calls;
+  std::set<void*> handles;
+  bool init_fails = false;
+  std::deque<Reply> replies;
+  int next_handle = 1;
+};
+
+World& world() {
+  static World w;
+  return w;
+}
+
+}  // namespace
+
+void Reset() {
+  world() = World();
+}
+
+const std::vector<Call>& Calls() { return world().calls; }
+
+int Count(const std::string& name) {
+  return static_cast<int>(std::count_if(world().calls.begin(), world().calls.end(),
+                                        [&](const Call& c) { return c.name == name; }));
+}
+
+int LiveHandles() { return static_cast<int>(world().handles.size()); }
+void SetInitFails(bool fails) { world().init_fails = fails; }
+void QueueReply(Reply reply) { world().replies.push_back(std::move(reply)); }
+
+}  // namespace punctuator_double
+
+using namespace punctuator_double;
+
+extern "C" void* punctuator_init(const char* model_path, const char* vocab_path,
+                                 const char* punc_path, const char* num_path,
+                                 const char* case_path, const char* xdb_path,
+                                 const char* bpe_path, const char* lang) {
+  Call call;
+  call.name = "punctuator_init";
+  call.strings = {model_path, vocab_path, punc_path, num_path, case_path, xdb_path, bpe_path, lang};
+  world().calls.push_back(call);
+  if (world().init_fails) return nullptr;
+  // Distinct non-null tokens; never dereferenced.
+  void* handle = reinterpret_cast<void*>(static_cast<uintptr_t>(world().next_handle++) << 4);
+  world().handles.insert(handle);
+  return handle;
+}
+
+extern "C" int punctuator_do_it(void* handle, const char* text, char* out, int32_t* size) {
+  Call call;
+  call.name = "punctuator_do_it";
+  call.text = text;
+  call.size_in = *size;
+  world().calls.push_back(call);
+  if (!world().handles.count(handle)) return 3;
+
+  Reply reply;
+  if (!world().replies.empty()) {
+    reply = world().replies.front();
+    world().replies.pop_front();
+  } else {
+    reply.output = std::string(text) + ".";
+    reply.size = static_cast<int32_t>(reply.output.size());
+    reply.result = reply.size > *size ? 1 : 0;
+  }
+  std::memcpy(out, reply.output.data(), std::min<size_t>(reply.output.size(), *size));
+  *size = reply.size;
+  return reply.result;
+}
+
+extern "C" void punctuator_relese(void* handle) {
+  Call call;
+  call.name = "punctuator_relese";
+  world().calls.push_back(call);
+  world().handles.erase(handle);
+}

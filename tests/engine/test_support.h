@@ -1,0 +1,41 @@
+// Helpers shared by the engine tests.
+#ifndef KVASR_TESTS_ENGINE_TEST_SUPPORT_H_
+#define KVASR_TESTS_ENGINE_TEST_SUPPORT_H_
+
+#include <gtest/gtest.h>
+
+#include <cstdio>
+#include <fstream>
+#include <string>
+#include <unistd.h>
+
+namespace kvasr_test {
+
+// A file that exists for the life of the object.
+class TempFile {
+ public:
+  explicit TempFile(const std::string& content) {
+    char name[] = "/tmp/kvasr-test-XXXXXX";
+    const int fd = mkstemp(name);
+    if (fd >= 0) close(fd);
+    path_ = name;
+    std::ofstream(path_, std::ios::binary) << content;
+  }
+  ~TempFile() { std::remove(path_.c_str()); }
+  const std::string& path() const { return path_; }
+
+ private:
+  std::string path_;
+};
+
+// Standard output of everything run inside `body`.
+template <typename F>
+std::string Stdout(F&& body) {
+  testing::internal::CaptureStdout();
+  body();
+  return testing::internal::GetCapturedStdout();
+}
+
+}  // namespace kvasr_test
+
+#endif  // KVASR_TESTS_ENGINE_TEST_SUPPORT_H_
