@@ -9,7 +9,7 @@ packages=(
   googletest libgtest-dev libgmock-dev libbenchmark-dev
   libcpprest-dev
   libsndfile1-dev libsamplerate0-dev
-  libpocketsphinx-dev pocketsphinx-en-us
+  libpocketsphinx-dev pocketsphinx-en-us pocketsphinx-testdata
   python3 python3-numpy
   binutils
 )

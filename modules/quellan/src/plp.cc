@@ -162,7 +162,12 @@ int PLP::AddWaveData(const int16_t* waveData, int smpNum) {
   }
   for (int t = 0; t < frame_num_; ++t) {
     const int16_t* samples = waveData + static_cast<size_t>(t) * frame_shift_;
-    for (int i = 0; i < frame_size_; ++i) {
+    // A block shorter than one window still counts one frame (the frame
+    // count truncates toward zero); its missing samples read as zeros.
+    const int available =
+        std::min(frame_size_, smpNum - t * frame_shift_);
+    for (int i = available; i < frame_size_; ++i) frame_[i + 1] = 0.0f;
+    for (int i = 0; i < available; ++i) {
       if (conf_.zero_mean_src) {
         const double centred = std::round(samples[i] - mean);
         frame_[i + 1] = static_cast<float>(std::clamp(centred, -32767.0, 32767.0));

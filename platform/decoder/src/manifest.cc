@@ -23,9 +23,9 @@ constexpr const char* kReservedOptions[] = {
     "hmm", "dict", "fdict", "lm", "lmctl", "lmname", "jsgf", "fsg",
     "kws", "keyphrase", "allphone", "logfn", "samprate"};
 
-// Files the recogniser's acoustic model loader needs. Their absence is
-// checked here because the loader terminates the process instead of
-// failing when one is missing.
+// Files the recogniser's acoustic model loader needs, checked here so that
+// a missing one is named: the loader fails without saying which, and ends
+// the whole process when the mixture weights are missing.
 constexpr const char* kAcousticModelFiles[] = {"mdef", "means", "variances",
                                                "transition_matrices"};
 // Mixture weights come in one of two forms.

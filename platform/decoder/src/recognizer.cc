@@ -59,6 +59,7 @@ class CallbackScope {
 }  // namespace
 
 std::unique_ptr<Recognizer> Recognizer::Create(const ModelSettings& settings) {
+  // Parsed as a command line, whose first word names the program.
   std::vector<std::string> args = {"kvasr_decoder",
                                    "-hmm", settings.acoustic_model_dir,
                                    "-dict", settings.dictionary};

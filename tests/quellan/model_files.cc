@@ -1,0 +1,139 @@
+#include "model_files.h"
+
+#include <sndfile.h>
+#include <stdlib.h>
+
+#include <cstdio>
+#include <fstream>
+#include <iterator>
+#include <stdexcept>
+
+namespace quellan_test {
+
+namespace {
+
+void Append(std::string* bytes, const void* data, size_t size) {
+  bytes->append(static_cast<const char*>(data), size);
+}
+
+void AppendInt(std::string* bytes, int32_t v) { Append(bytes, &v, sizeof(v)); }
+
+void AppendFloats(std::string* bytes, const std::vector<float>& v) {
+  Append(bytes, v.data(), v.size() * sizeof(float));
+}
+
+}  // namespace
+
+void WriteBytes(const std::string& path, const std::string& bytes) {
+  std::ofstream f(path, std::ios::binary | std::ios::trunc);
+  f.write(bytes.data(), static_cast<std::streamsize>(bytes.size()));
+  if (!f) throw std::runtime_error("cannot write " + path);
+}
+
+std::string ReadBytes(const std::string& path) {
+  std::ifstream f(path, std::ios::binary);
+  return std::string(std::istreambuf_iterator<char>(f), {});
+}
+
+void WriteNetwork(const std::string& path, const Network& net,
+                  const std::string& flag) {
+  std::string bytes = flag;
+  AppendInt(&bytes, net.input_length);
+  AppendInt(&bytes, net.output_length);
+  AppendInt(&bytes, static_cast<int32_t>(net.hidden.size()));
+  for (int h : net.hidden) AppendInt(&bytes, h);
+  for (const Layer& layer : net.layers) {
+    AppendFloats(&bytes, layer.bias);
+    AppendFloats(&bytes, layer.weights);
+  }
+  WriteBytes(path, bytes);
+}
+
+void WritePriors(const std::string& path, const std::vector<float>& priors) {
+  std::string bytes;
+  AppendInt(&bytes, static_cast<int32_t>(priors.size()));
+  AppendFloats(&bytes, priors);
+  WriteBytes(path, bytes);
+}
+
+void WriteMeanTable(const std::string& path, const std::vector<float>& means,
+                    const std::vector<float>& variances) {
+  std::string bytes;
+  AppendInt(&bytes, static_cast<int32_t>(means.size()));
+  AppendFloats(&bytes, means);
+  AppendFloats(&bytes, variances);
+  WriteBytes(path, bytes);
+}
+
+Network SignNetwork(int feat_dim, int start_offset, int end_offset,
+                    int column) {
+  Network net;
+  net.input_length = feat_dim * (1 + start_offset + end_offset);
+  net.output_length = 2;
+  net.hidden = {1};
+  Layer hidden;
+  hidden.bias = {0.0f};
+  hidden.weights.assign(net.input_length, 0.0f);
+  hidden.weights[start_offset * feat_dim + column] = 20.0f;
+  Layer out;
+  // Non-speech logit 0, speech logit 40 h - 20: a saturated +/-20 margin.
+  out.bias = {0.0f, -20.0f};
+  out.weights = {0.0f, 40.0f};
+  net.layers = {hidden, out};
+  return net;
+}
+
+Network ConstantNetwork(int input_length, float score) {
+  Network net;
+  net.input_length = input_length;
+  net.output_length = 2;
+  net.hidden = {1};
+  Layer hidden;
+  hidden.bias = {0.0f};
+  hidden.weights.assign(input_length, 0.0f);
+  Layer out;
+  out.bias = {0.0f, score};
+  out.weights = {0.0f, 0.0f};
+  net.layers = {hidden, out};
+  return net;
+}
+
+std::string MakeTempDir() {
+  const char* base = std::getenv("TMPDIR");
+  std::string pattern = std::string(base != nullptr ? base : "/tmp") +
+                        "/quellan_test_XXXXXX";
+  if (mkdtemp(pattern.data()) == nullptr) {
+    throw std::runtime_error("mkdtemp failed");
+  }
+  return pattern;
+}
+
+std::string MakeModelDir(float score) {
+  const std::string dir = MakeTempDir();
+  WriteNetwork(dir + "/quellan_data_b", ConstantNetwork(39 * 11, score));
+  WritePriors(dir + "/quellan_data_c", {1.0f, 1.0f});
+  WriteMeanTable(dir + "/quellan_data_a", std::vector<float>(39, 0.0f),
+                 std::vector<float>(39, 1.0f));
+  return dir;
+}
+
+std::string CorpusPath(const std::string& relative) {
+  return std::string(QUELLAN_TEST_CORPUS_DIR) + "/" + relative;
+}
+
+bool ReadFlac(const std::string& path, std::vector<int16_t>* samples) {
+  SF_INFO info{};
+  SNDFILE* f = sf_open(path.c_str(), SFM_READ, &info);
+  if (f == nullptr) return false;
+  if (info.channels != 1 || info.samplerate != 16000) {
+    sf_close(f);
+    return false;
+  }
+  samples->resize(static_cast<size_t>(info.frames));
+  const sf_count_t got = sf_read_short(f, samples->data(), info.frames);
+  sf_close(f);
+  samples->resize(static_cast<size_t>(got));
+  return got > 0;
+}
+
+}  // namespace quellan_test
