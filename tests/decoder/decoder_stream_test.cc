@@ -38,7 +38,7 @@ std::vector<int16_t> WithSilence(int64_t before_ms, std::vector<int16_t> samples
 class DecoderStream : public testing::Test {
  protected:
   void SetUp() override {
-    KVASR_REQUIRE_TEST_DATA();
+    KVASR_REQUIRE_LIBRIVOX();
     clip_ = LibrivoxClip("0880");        // "he was not an ill disposed young man"
     other_clip_ = LibrivoxClip("0930");  // "he might even have been made amiable himself"
     ASSERT_FALSE(clip_.empty() || other_clip_.empty());

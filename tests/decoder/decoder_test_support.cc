@@ -2,35 +2,10 @@
 
 #include <cstdio>
 #include <cstring>
-#include <fstream>
-#include <iterator>
 
 #include "kvasr_decoder_api.h"
 
 namespace kvasr_decoder_test {
-
-std::string TestDataPath(const std::string& relative) {
-  return std::string(KVASR_DECODER_TEST_DATA) + "/" + relative;
-}
-
-std::vector<int16_t> LibrivoxClip(const std::string& id) {
-  const std::string path =
-      TestDataPath("librivox/sense_and_sensibility_01_austen_64kb-" + id + ".wav");
-  std::ifstream in(path, std::ios::binary);
-  const std::string bytes((std::istreambuf_iterator<char>(in)), std::istreambuf_iterator<char>());
-  // These recordings have the plain 44-byte header: PCM, mono, 16 kHz, 16 bit.
-  constexpr size_t kHeaderBytes = 44;
-  const char kFormat[] = "WAVEfmt \x10\0\0\0\x01\0\x01\0\x80\x3e\0\0";
-  if (bytes.size() < kHeaderBytes || bytes.compare(0, 4, "RIFF") != 0 ||
-      bytes.compare(8, sizeof kFormat - 1, kFormat, sizeof kFormat - 1) != 0 ||
-      bytes.compare(34, 2, "\x10\0", 2) != 0 || bytes.compare(36, 4, "data") != 0) {
-    ADD_FAILURE() << path << " is not 16 kHz mono PCM with a plain header";
-    return {};
-  }
-  std::vector<int16_t> samples((bytes.size() - kHeaderBytes) / 2);
-  memcpy(samples.data(), bytes.data() + kHeaderBytes, samples.size() * 2);
-  return samples;
-}
 
 Session::Session() {
   FILE* file = fopen(KVASR_DECODER_MANIFEST, "rb");

@@ -10,19 +10,15 @@
 #include <string>
 #include <vector>
 
+#include "librivox.h"
+
 namespace kvasr_decoder_test {
 
 constexpr int64_t kSamplesPerMs = 16;
 constexpr int64_t kChunkSamples = 100 * kSamplesPerMs;
 
-// Recordings of Debian's pocketsphinx-testdata.
-std::string TestDataPath(const std::string& relative);
-#define KVASR_REQUIRE_TEST_DATA()                                                   \
-  if (access(kvasr_decoder_test::TestDataPath("librivox").c_str(), R_OK) != 0)      \
-  GTEST_SKIP() << "recordings missing: install the Debian package pocketsphinx-testdata"
-
-// Samples of a LibriVox recording by its number, e.g. "0880".
-std::vector<int16_t> LibrivoxClip(const std::string& id);
+using kvasr_test::LibrivoxClip;
+using kvasr_test::TestDataPath;
 
 struct Event {
   bool is_result;      // else speech end

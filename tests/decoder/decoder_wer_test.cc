@@ -4,10 +4,8 @@
 #include <gtest/gtest.h>
 #include <time.h>
 
-#include <fstream>
 #include <iomanip>
 #include <iostream>
-#include <sstream>
 #include <string>
 #include <vector>
 
@@ -21,55 +19,6 @@ namespace {
 // loss of accuracy shows. See platform/decoder/README.md.
 constexpr double kMaxOverallWer = 0.32;
 
-struct Reference {
-  std::string id;
-  std::vector<std::string> words;
-};
-
-std::vector<std::string> Words(const std::string& text) {
-  std::istringstream in(text);
-  std::vector<std::string> words;
-  for (std::string word; in >> word;) words.push_back(word);
-  return words;
-}
-
-// Lines "<s> words </s> (file-id)".
-std::vector<Reference> ReadTranscription(const std::string& path) {
-  std::ifstream in(path);
-  std::vector<Reference> references;
-  for (std::string line; std::getline(in, line);) {
-    const size_t open = line.rfind('(');
-    const size_t close = line.rfind(')');
-    if (open == std::string::npos || close == std::string::npos || close < open) continue;
-    Reference reference;
-    const std::string full_id = line.substr(open + 1, close - open - 1);
-    reference.id = full_id.substr(full_id.rfind('-') + 1);
-    for (std::string& word : Words(line.substr(0, open))) {
-      if (word != "<s>" && word != "</s>") reference.words.push_back(word);
-    }
-    references.push_back(reference);
-  }
-  return references;
-}
-
-// Word-level edit distance: substitutions, insertions and deletions.
-size_t EditDistance(const std::vector<std::string>& reference,
-                    const std::vector<std::string>& hypothesis) {
-  std::vector<size_t> row(hypothesis.size() + 1);
-  for (size_t j = 0; j < row.size(); ++j) row[j] = j;
-  for (size_t i = 1; i <= reference.size(); ++i) {
-    size_t diagonal = row[0];
-    row[0] = i;
-    for (size_t j = 1; j <= hypothesis.size(); ++j) {
-      const size_t above = row[j];
-      row[j] = std::min({row[j] + 1, row[j - 1] + 1,
-                         diagonal + (reference[i - 1] == hypothesis[j - 1] ? 0 : 1)});
-      diagonal = above;
-    }
-  }
-  return row[hypothesis.size()];
-}
-
 double CpuSeconds() {
   timespec now;
   clock_gettime(CLOCK_PROCESS_CPUTIME_ID, &now);
@@ -77,9 +26,8 @@ double CpuSeconds() {
 }
 
 TEST(DecoderAccuracy, LibrivoxWordErrorRateStaysWithinBound) {
-  KVASR_REQUIRE_TEST_DATA();
-  const std::vector<Reference> references =
-      ReadTranscription(TestDataPath("librivox/transcription"));
+  KVASR_REQUIRE_LIBRIVOX();
+  const std::vector<kvasr_test::LibrivoxReference> references = kvasr_test::LibrivoxReferences();
   ASSERT_EQ(references.size(), 5u);
 
   // One decoder for all recordings, as the engine keeps it across utterances.
@@ -88,7 +36,7 @@ TEST(DecoderAccuracy, LibrivoxWordErrorRateStaysWithinBound) {
   size_t total_words = 0;
   double audio_seconds = 0;
   double cpu_seconds = 0;
-  for (const Reference& reference : references) {
+  for (const kvasr_test::LibrivoxReference& reference : references) {
     const std::vector<int16_t> clip = LibrivoxClip(reference.id);
     ASSERT_FALSE(clip.empty());
     const double cpu_before = CpuSeconds();
@@ -98,8 +46,8 @@ TEST(DecoderAccuracy, LibrivoxWordErrorRateStaysWithinBound) {
 
     const std::vector<Event> finals = session.Finals();
     ASSERT_FALSE(finals.empty());
-    const std::vector<std::string> hypothesis = Words(finals.back().text);
-    const size_t errors = EditDistance(reference.words, hypothesis);
+    const std::vector<std::string> hypothesis = kvasr_test::Words(finals.back().text);
+    const size_t errors = kvasr_test::EditDistance(reference.words, hypothesis);
     total_errors += errors;
     total_words += reference.words.size();
     std::cout << "clip " << reference.id << ": WER " << std::fixed << std::setprecision(3)

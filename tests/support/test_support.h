@@ -1,6 +1,6 @@
-// Helpers shared by the engine tests.
-#ifndef KVASR_TESTS_ENGINE_TEST_SUPPORT_H_
-#define KVASR_TESTS_ENGINE_TEST_SUPPORT_H_
+// Helpers shared by the tests: temporary files, captured standard output.
+#ifndef KVASR_TESTS_SUPPORT_TEST_SUPPORT_H_
+#define KVASR_TESTS_SUPPORT_TEST_SUPPORT_H_
 
 #include <gtest/gtest.h>
 
@@ -38,4 +38,4 @@ std::string Stdout(F&& body) {
 
 }  // namespace kvasr_test
 
-#endif  // KVASR_TESTS_ENGINE_TEST_SUPPORT_H_
+#endif  // KVASR_TESTS_SUPPORT_TEST_SUPPORT_H_

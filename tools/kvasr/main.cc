@@ -1,0 +1,142 @@
+// kvasr: command-line front end of the offline recogniser.
+#include <fcntl.h>
+#include <getopt.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <climits>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+#include <string>
+
+#include "kvasr_offline.h"
+#include "transcribe.h"
+
+namespace {
+
+constexpr char kUsage[] =
+    "usage: kvasr transcribe [options] FILE...\n"
+    "       kvasr version\n"
+    "\n"
+    "Transcribes WAV, FLAC or OGG files (any rate and channel count), or raw\n"
+    "16 kHz 16-bit mono little-endian sound from standard input for '-'.\n"
+    "Prints the final texts, one per line (prefixed by the file name and a tab\n"
+    "when several inputs are given).\n"
+    "\n"
+    "options:\n"
+    "  --model FILE            decoder model manifest (default: the shipped en-us one)\n"
+    "  --vad-models DIR        VAD model folder (default: the shipped one)\n"
+    "  --no-vad                feed all sound to the decoder\n"
+    "  --punct                 punctuate final texts with the shipped English model\n"
+    "  --punct-settings FILE   punctuation settings (JSON object of local_punc_settings)\n"
+    "  --lang CODE             language code (default en-US)\n"
+    "  --json                  print every result message as JSON\n"
+    "  --chunk-ms N            milliseconds of sound per call (default 100)\n"
+    "  --max-silence-before-ms N, --max-silence-after-ms N\n"
+    "                          end listening after this much silence (VAD on; 0: never)\n"
+    "  --no-progress           no progress bar\n"
+    "  --verbose               show the library's log on standard error\n";
+
+enum Option {
+  kModel = 256, kVadModels, kNoVad, kPunct, kPunctSettings, kLang, kJson, kChunkMs,
+  kSilenceBefore, kSilenceAfter, kNoProgress, kVerbose, kHelp
+};
+
+bool ParseInt(const char* text, long min, long max, long* out) {
+  errno = 0;
+  char* end = nullptr;
+  const long v = std::strtol(text, &end, 10);
+  if (errno != 0 || end == text || *end != '\0' || v < min || v > max) return false;
+  *out = v;
+  return true;
+}
+
+// The library logs on standard output; keep that stream for the texts and
+// send the log to standard error, or nowhere.
+FILE* TakeStdoutForResults(bool verbose) {
+  std::fflush(stdout);
+  const int results_fd = dup(STDOUT_FILENO);
+  const int log_fd = verbose ? dup(STDERR_FILENO) : open("/dev/null", O_WRONLY);
+  if (results_fd < 0 || log_fd < 0) return stdout;
+  dup2(log_fd, STDOUT_FILENO);
+  close(log_fd);
+  return fdopen(results_fd, "w");
+}
+
+int Transcribe(int argc, char** argv) {
+  static const struct option kOptions[] = {
+      {"model", required_argument, nullptr, kModel},
+      {"vad-models", required_argument, nullptr, kVadModels},
+      {"no-vad", no_argument, nullptr, kNoVad},
+      {"punct", no_argument, nullptr, kPunct},
+      {"punct-settings", required_argument, nullptr, kPunctSettings},
+      {"lang", required_argument, nullptr, kLang},
+      {"json", no_argument, nullptr, kJson},
+      {"chunk-ms", required_argument, nullptr, kChunkMs},
+      {"max-silence-before-ms", required_argument, nullptr, kSilenceBefore},
+      {"max-silence-after-ms", required_argument, nullptr, kSilenceAfter},
+      {"no-progress", no_argument, nullptr, kNoProgress},
+      {"verbose", no_argument, nullptr, kVerbose},
+      {"help", no_argument, nullptr, kHelp},
+      {nullptr, 0, nullptr, 0}};
+  kvasr_cli::TranscribeOptions o;
+  bool verbose = false;
+  long n = 0;
+  int c;
+  while ((c = getopt_long(argc, argv, "", kOptions, nullptr)) != -1) {
+    switch (c) {
+      case kModel: o.decoder_model = optarg; break;
+      case kVadModels: o.vad_dir = optarg; break;
+      case kNoVad: o.vad = false; break;
+      case kPunct: o.punct = true; break;
+      case kPunctSettings: o.punct = true; o.punct_settings = optarg; break;
+      case kLang: o.lang = optarg; break;
+      case kJson: o.json = true; break;
+      case kNoProgress: o.progress = false; break;
+      case kVerbose: verbose = true; break;
+      case kChunkMs:
+        if (!ParseInt(optarg, 1, 60000, &n)) {
+          std::fprintf(stderr, "kvasr: --chunk-ms takes milliseconds from 1 to 60000\n");
+          return 2;
+        }
+        o.chunk_ms = static_cast<int>(n);
+        break;
+      case kSilenceBefore:
+      case kSilenceAfter:
+        // The engine counts in 32-bit samples: 16 per millisecond.
+        if (!ParseInt(optarg, 0, UINT32_MAX / 16, &n)) {
+          std::fprintf(stderr, "kvasr: silence limits take milliseconds from 0 to %u\n", UINT32_MAX / 16);
+          return 2;
+        }
+        (c == kSilenceBefore ? o.max_silence_before_ms : o.max_silence_after_ms) = static_cast<uint32_t>(n);
+        break;
+      case kHelp: std::fputs(kUsage, stdout); return 0;
+      default: std::fputs(kUsage, stderr); return 2;
+    }
+  }
+  for (int i = optind; i < argc; ++i) o.inputs.push_back(argv[i]);
+  if (o.inputs.empty()) {
+    std::fputs("kvasr: no input given\n", stderr);
+    std::fputs(kUsage, stderr);
+    return 2;
+  }
+  return kvasr_cli::RunTranscribe(o, TakeStdoutForResults(verbose));
+}
+
+}  // namespace
+
+int main(int argc, char** argv) {
+  const std::string command = argc > 1 ? argv[1] : "";
+  if (command == "transcribe") return Transcribe(argc - 1, argv + 1);
+  if (command == "version") {
+    std::printf("kvasr %s\n", vorta_speech_get_offline_asr_version());
+    return 0;
+  }
+  if (command == "-h" || command == "--help" || command == "help") {
+    std::fputs(kUsage, stdout);
+    return 0;
+  }
+  std::fputs(kUsage, stderr);
+  return 2;
+}
