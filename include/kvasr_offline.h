@@ -39,21 +39,23 @@ typedef void (*vorta_speech_result_callback)(void* engine,
 KVASR_API const char* vorta_speech_get_offline_asr_version(void);
 
 /* New engine in the state "not initialised". Owned by the caller until
- * vorta_speech_release_offline_asr_engine. Never returns null. */
+ * vorta_speech_release_offline_asr_engine. Null only when memory is
+ * exhausted. */
 KVASR_API void* vorta_speech_create_offline_asr_engine(void);
 
 /* Closes and frees the engine. The handle is invalid afterwards. Null: no-op. */
 KVASR_API void vorta_speech_release_offline_asr_engine(void* engine);
 
-/* Loads the models named by the JSON text `params` (must not be null; read
- * during the call only). Returns 0, or -1 on a null engine, bad parameters,
- * unloadable models or an engine that is already initialised. */
+/* Loads the models named by the JSON text `params` (read during the call
+ * only). Returns 0, or -1 on a null engine or text, bad parameters,
+ * unloadable models, exhausted memory or an engine that is already
+ * initialised. */
 KVASR_API int vorta_speech_offline_asr_init(void* engine, const char* params);
 
 /* Starts a listening period with the silence limits in the JSON text
  * `params`. `callback` may be null (results are then dropped); `context` is
- * handed back unchanged. Returns 0, or -1 on a null engine, bad parameters or
- * an engine that is not initialised. */
+ * handed back unchanged. Returns 0, or -1 on a null engine or text, bad
+ * parameters or an engine that is not initialised. */
 KVASR_API int vorta_speech_offline_asr_start(void* engine, const char* params,
                                              vorta_speech_result_callback callback,
                                              void* context);

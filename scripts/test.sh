@@ -1,7 +1,8 @@
 #!/usr/bin/env bash
-# Sets up the machine, builds kvasr twice (plain with warnings as errors, and
-# with AddressSanitizer + UndefinedBehaviorSanitizer) and runs every test in
-# both builds.
+# Sets up the machine and runs every check: the test suite in a plain build
+# (warnings as errors), each fuzz target for a bounded time, the four-engine
+# test under ThreadSanitizer, and the test suite again under
+# AddressSanitizer + UndefinedBehaviorSanitizer.
 set -euo pipefail
 cd "$(dirname "$0")/.."
 
@@ -14,8 +15,16 @@ cmake -S . -B build -DCMAKE_BUILD_TYPE=RelWithDebInfo -DKVASR_WERROR=ON
 cmake --build build -j"$jobs"
 ctest --test-dir build --output-on-failure -j"$jobs"
 
+echo "== fuzzing (libFuzzer, ASan + UBSan), ${FUZZ_SECONDS:=50} s per target"
+FUZZ_SECONDS=$FUZZ_SECONDS bash fuzz/run.sh
+
+echo "== ThreadSanitizer: four engines on four threads"
+bash tests/reliability/tsan.sh
+
 echo "== AddressSanitizer + UndefinedBehaviorSanitizer build"
 cmake -S . -B build-asan -DCMAKE_BUILD_TYPE=Debug -DKVASR_SANITIZE=ON -DKVASR_WERROR=ON
 cmake --build build-asan -j"$jobs"
+# Accuracy measurements run the same code as the other tests; the plain
+# build covers them.
 ASAN_OPTIONS=detect_leaks=1:abort_on_error=1 UBSAN_OPTIONS=print_stacktrace=1:halt_on_error=1 \
-  ctest --test-dir build-asan --output-on-failure -j"$jobs"
+  ctest --test-dir build-asan --output-on-failure -j"$jobs" -LE accuracy

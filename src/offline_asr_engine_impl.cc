@@ -47,12 +47,56 @@ uint32_t MuteLimitSamples(const value& asr, const char* key) {
   return samples == 0 ? kNoLimit : samples;
 }
 
+// Texts from the decoder or punctuation library are passed through as they
+// are, except that bytes which are not UTF-8 become U+FFFD: hosts must be
+// able to parse every message.
+std::string ValidUtf8(const std::string& text) {
+  static const char kReplacement[] = "\xEF\xBF\xBD";
+  std::string out;
+  out.reserve(text.size());
+  size_t i = 0;
+  while (i < text.size()) {
+    const unsigned char lead = static_cast<unsigned char>(text[i]);
+    size_t length = 0;
+    uint32_t min_code = 0;
+    if (lead < 0x80) {
+      length = 1;
+    } else if (lead >= 0xC2 && lead <= 0xDF) {
+      length = 2;
+      min_code = 0x80;
+    } else if (lead >= 0xE0 && lead <= 0xEF) {
+      length = 3;
+      min_code = 0x800;
+    } else if (lead >= 0xF0 && lead <= 0xF4) {
+      length = 4;
+      min_code = 0x10000;
+    }
+    bool valid = length > 0 && i + length <= text.size();
+    uint32_t code = length == 1 ? lead : lead & (0x7F >> length);
+    for (size_t k = 1; valid && k < length; ++k) {
+      const unsigned char c = static_cast<unsigned char>(text[i + k]);
+      valid = (c & 0xC0) == 0x80;
+      code = (code << 6) | (c & 0x3F);
+    }
+    // Overlong forms, surrogates and values beyond U+10FFFF are not UTF-8.
+    valid = valid && code >= min_code && code <= 0x10FFFF && (code < 0xD800 || code > 0xDFFF);
+    if (valid) {
+      out.append(text, i, length);
+      i += length;
+    } else {
+      out += kReplacement;
+      ++i;
+    }
+  }
+  return out;
+}
+
 // Objects keep their keys sorted, which fixes the key order of the message.
 std::string BuildResultMessage(int status, const std::string& message, const std::string& text,
                                bool is_break) {
   value result = value::object(false);
   result[U("isBreak")] = value::boolean(is_break);
-  result[U("text")] = value::string(text);
+  result[U("text")] = value::string(ValidUtf8(text));
   value root = value::object(false);
   root[U("message")] = value::string(message);
   root[U("result")] = std::move(result);
@@ -84,6 +128,10 @@ bool OfflineAsrEngineImpl::Init(std::string params) {
     if (vad_enabled) {
       vad_ = std::make_shared<Vad>(vad_dir);
       if (!vad_->Init()) throw std::runtime_error("init vad failed");
+    } else {
+      // A segment buffer left by an earlier failed Init must not filter the
+      // audio of an engine initialised without one.
+      vad_ = nullptr;
     }
     InitLocalAsr(root, lang);
     state_ = kInitialized;

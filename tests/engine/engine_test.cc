@@ -148,6 +148,15 @@ TEST_F(EngineTest, VadIsCreatedOnlyWhenEnabledAndItsFailureFailsInit) {
   EXPECT_EQ(decoder_double::Count("mwDecoderInit"), 0);
 }
 
+TEST_F(EngineTest, AnInitWithoutVadDropsTheBufferOfAFailedOne) {
+  decoder_double::SetInitFails(true);
+  Stdout([&] { EXPECT_FALSE(engine_.Init(InitParams(R"(,"vad_enabled":true)"))); });
+  EXPECT_TRUE(engine_.has_vad());
+  decoder_double::SetInitFails(false);
+  Stdout([&] { ASSERT_TRUE(engine_.Init(InitParams())); });
+  EXPECT_FALSE(engine_.has_vad());
+}
+
 TEST_F(EngineTest, PunctuationSettingsAreReadKeyByKey) {
   const std::string settings =
       R"(,"local_punc_settings":{"model_path":"m","vocab_path":5,"punc_path":"p",)"
@@ -328,6 +337,26 @@ TEST_F(EngineTest, ResultsBecomeCompactSortedJson) {
             R"({"message":"Success","result":{"isBreak":false,"text":"say \"hi\" \\ ok"},"status":0})");
   EXPECT_EQ(messages_[3],
             "{\"message\":\"Success\",\"result\":{\"isBreak\":false,\"text\":\"na\xc3\xafve\"},\"status\":0}");
+}
+
+TEST_F(EngineTest, TextsThatAreNotUtf8StillGiveValidJson) {
+  Started("");
+  const std::vector<std::pair<std::string, std::string>> cases = {
+      {"a\xff b", "a\xEF\xBF\xBD b"},                               // stray byte
+      {"\xC0\xAF", "\xEF\xBF\xBD\xEF\xBF\xBD"},                    // overlong slash
+      {"\xED\xA0\x80", "\xEF\xBF\xBD\xEF\xBF\xBD\xEF\xBF\xBD"},  // surrogate
+      {"end\xE2\x82", "end\xEF\xBF\xBD\xEF\xBF\xBD"},               // cut short
+      {"\xF0\x9F\x98\x80 ok", "\xF0\x9F\x98\x80 ok"},               // valid 4-byte form
+  };
+  for (const auto& c : cases) {
+    messages_.clear();
+    decoder_double::QueueOnSetData({decoder_double::Result(c.first, 1)});
+    const uint16_t s = 0;
+    Stdout([&] { ASSERT_TRUE(engine_.ProcessSoundData(&s, 1, 0)); });
+    ASSERT_EQ(messages_.size(), 1u);
+    EXPECT_EQ(messages_[0], R"({"message":"Success","result":{"isBreak":true,"text":")" + c.second +
+                                R"("},"status":0})");
+  }
 }
 
 TEST_F(EngineTest, FinalTextsArePunctuatedAndPartialTextsLoggedAsSkipped) {

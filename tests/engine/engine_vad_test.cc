@@ -6,7 +6,6 @@
 #include <gtest/gtest.h>
 
 #include <algorithm>
-#include <fstream>
 #include <string>
 #include <vector>
 
@@ -26,21 +25,6 @@ constexpr int kSamplesPerSecond = 16000;
 
 std::vector<uint16_t> Silence(double seconds) {
   return std::vector<uint16_t>(static_cast<size_t>(seconds * kSamplesPerSecond), 0);
-}
-
-// Resident set size in KiB, from the kernel.
-long ResidentKiB() {
-  std::ifstream status("/proc/self/status");
-  std::string key;
-  long value = 0;
-  while (status >> key) {
-    if (key == "VmRSS:") {
-      status >> value;
-      return value;
-    }
-    status.ignore(1 << 10, '\n');
-  }
-  return -1;
 }
 
 class EngineVadTest : public testing::Test {
@@ -131,35 +115,6 @@ TEST_F(EngineVadTest, SilenceAfterSpeechEndsTheListeningPeriod) {
   EXPECT_EQ(messages_[0],
             R"({"message":"vad mute timeout","result":{"isBreak":true,"text":""},"status":-100})");
   EXPECT_EQ(engine_.state(), 1);
-}
-
-// Half an hour in one listening period: memory stays at the engine's fixed
-// buffers and every second of speech keeps reaching the decoder.
-TEST_F(EngineVadTest, LongListeningPeriodKeepsMemoryFlat) {
-  Start("{}");
-  std::vector<uint16_t> cycle = speech_;
-  cycle.insert(cycle.end(), 3 * kSamplesPerSecond, 0);
-  const double cycle_s = static_cast<double>(cycle.size()) / kSamplesPerSecond;
-  const int cycles = static_cast<int>(KVASR_LONG_LISTENING_MINUTES * 60 / cycle_s);
-  long rss_after_warmup = 0;
-  size_t decoded = 0;
-  int completed = 0;
-  for (int i = 0; i < cycles; ++i) {
-    ASSERT_TRUE(Feed(cycle)) << "cycle " << i;
-    for (const auto& call : decoder_double::Calls()) {
-      if (call.name != "mwSetData") continue;
-      decoded += call.samples.size();
-      completed += call.args[1] == 1;
-    }
-    decoder_double::ClearCalls();
-    if (i == cycles / 10) rss_after_warmup = ResidentKiB();
-  }
-  const long rss_end = ResidentKiB();
-  std::fprintf(stderr, "%d cycles (%.1f min): RSS %ld KiB after warm-up, %ld KiB at the end\n", cycles,
-               cycles * cycle_s / 60, rss_after_warmup, rss_end);
-  EXPECT_LE(rss_end - rss_after_warmup, 2048);
-  EXPECT_GE(completed, cycles - 1);
-  EXPECT_GE(decoded, (cycles - 1) * speech_.size());
 }
 
 }  // namespace

@@ -80,6 +80,16 @@ int load_base_info_cmsfp(PLP* plp, const PlpConfig* conf, FILE* cmsfp) {
     QUELLAN_WARN("read cms table error\n");
     return -1;
   }
+  // A NaN, an infinity or a negative variance would make every normalised
+  // feature NaN from the first frame on.
+  for (uint32_t i = 0; i < dim; ++i) {
+    if (!std::isfinite(plp->cms_mean_[i]) || !std::isfinite(plp->cms_var_[i]) ||
+        plp->cms_var_[i] < 0.0f) {
+      QUELLAN_WARN("read cms table error: dimension %u is not a finite mean and "
+                   "variance\n", i);
+      return -1;
+    }
+  }
   return 0;
 }
 

@@ -1,5 +1,8 @@
 #include "vad_dnn.h"
 
+#include <sys/stat.h>
+
+#include <algorithm>
 #include <cmath>
 #include <cstdlib>
 #include <cstring>
@@ -19,6 +22,22 @@ bool read_int32(FILE* f, int32_t* value) {
   return std::fread(value, sizeof(*value), 1, f) == 1;
 }
 
+// Bytes between the read position and the end of a regular file; -1 when
+// the file's size is not known.
+int64_t bytes_left(FILE* f) {
+  struct stat st;
+  const long at = std::ftell(f);
+  if (fstat(fileno(f), &st) != 0 || !S_ISREG(st.st_mode) || at < 0) return -1;
+  return std::max<int64_t>(0, static_cast<int64_t>(st.st_size) - at);
+}
+
+bool all_finite(const float* values, size_t count) {
+  for (size_t i = 0; i < count; ++i) {
+    if (!std::isfinite(values[i])) return false;
+  }
+  return true;
+}
+
 void release_layers(VadDnn* dnn) {
   if (dnn->layers == nullptr) return;
   for (int i = 0; i < dnn->layers_num; ++i) {
@@ -30,18 +49,36 @@ void release_layers(VadDnn* dnn) {
   dnn->layers = nullptr;
 }
 
+// Outputs summed side by side: a block of this many runs through the inputs
+// together, which vectorises while each output still adds its terms in
+// ascending input order.
+constexpr int kOutputBlock = 32;
+
 // out[r][j] = alpha * sum_k w[k][j] * in[r][k] + beta * out[r][j]
 void layer_product(const float* in, int rows, int in_dim, const float* weights,
                    int out_dim, float alpha, float beta, float* out) {
   for (int r = 0; r < rows; ++r) {
     const float* in_row = in + static_cast<size_t>(r) * in_dim;
     float* out_row = out + static_cast<size_t>(r) * out_dim;
-    for (int j = 0; j < out_dim; ++j) {
-      float sum = 0.0f;
-      for (int k = 0; k < in_dim; ++k) {
-        sum += weights[static_cast<size_t>(k) * out_dim + j] * in_row[k];
+    for (int j0 = 0; j0 < out_dim; j0 += kOutputBlock) {
+      const int width = out_dim - j0 < kOutputBlock ? out_dim - j0 : kOutputBlock;
+      float sum[kOutputBlock] = {};
+      if (width == kOutputBlock) {
+        for (int k = 0; k < in_dim; ++k) {
+          const float* w = weights + static_cast<size_t>(k) * out_dim + j0;
+          const float x = in_row[k];
+          for (int j = 0; j < kOutputBlock; ++j) sum[j] += w[j] * x;
+        }
+      } else {
+        for (int k = 0; k < in_dim; ++k) {
+          const float* w = weights + static_cast<size_t>(k) * out_dim + j0;
+          const float x = in_row[k];
+          for (int j = 0; j < width; ++j) sum[j] += w[j] * x;
+        }
       }
-      out_row[j] = alpha * sum + beta * out_row[j];
+      for (int j = 0; j < width; ++j) {
+        out_row[j0 + j] = alpha * sum[j] + beta * out_row[j0 + j];
+      }
     }
   }
 }
@@ -127,6 +164,9 @@ int load_all_dnn_layers(VadDnn* dnn, FILE* f) {
     return -1;
   }
   const int last = dnn->layers_num - 1;
+  // Dimensions within their bounds can still ask for gigabytes; a file too
+  // short to hold them is refused before anything that large is allocated.
+  int64_t left = bytes_left(f);
   for (int i = 0; i <= last; ++i) {
     // Without hidden layers the single layer maps the input straight to the
     // classes.
@@ -139,6 +179,17 @@ int load_all_dnn_layers(VadDnn* dnn, FILE* f) {
     VadDnnLayer& layer = dnn->layers[i];
     const size_t weight_count =
         static_cast<size_t>(layer.input_dim) * layer.output_dim;
+    if (left >= 0) {
+      const int64_t bias_bytes = static_cast<int64_t>(sizeof(float)) * layer.output_dim;
+      const int64_t weight_bytes = static_cast<int64_t>(sizeof(float) * weight_count);
+      if (left < bias_bytes || left - bias_bytes < weight_bytes) {
+        QUELLAN_WARN("Failed to load layers[%d].%s in load_all_dnn_layers\n\n", i,
+                     left < bias_bytes ? "bias" : "weights");
+        release_layers(dnn);
+        return -1;
+      }
+      left -= bias_bytes + weight_bytes;
+    }
     layer.bias =
         static_cast<float*>(std::malloc(sizeof(float) * layer.output_dim));
     if (layer.bias == nullptr) {
@@ -165,6 +216,15 @@ int load_all_dnn_layers(VadDnn* dnn, FILE* f) {
         weight_count) {
       QUELLAN_WARN(
           "Failed to load layers[%d].weights in load_all_dnn_layers\n\n", i);
+      release_layers(dnn);
+      return -1;
+    }
+    // A NaN or infinity would silently turn every score into NaN, which
+    // never counts as speech.
+    if (!all_finite(layer.bias, layer.output_dim) ||
+        !all_finite(layer.weights, weight_count)) {
+      QUELLAN_WARN("layers[%d] holds a value that is not a finite number in "
+                   "load_all_dnn_layers\n\n", i);
       release_layers(dnn);
       return -1;
     }
@@ -202,6 +262,16 @@ int load_vaddnn_state_weights(VadDnn* dnn, const char* name) {
     return -1;
   }
   std::fclose(f);
+  // Posteriors are divided by the priors: only positive finite ones give
+  // finite scores.
+  for (int j = 0; j < dnn->output_length; ++j) {
+    if (!(dnn->state_weights[j] > 0.0f) || !std::isfinite(dnn->state_weights[j])) {
+      QUELLAN_WARN("state_weights[%d] is not a positive finite number\n\n", j);
+      std::free(dnn->state_weights);
+      dnn->state_weights = nullptr;
+      return -1;
+    }
+  }
   return 0;
 }
 

@@ -1,0 +1,37 @@
+// Runs a fuzz target's entry point over saved inputs, without libFuzzer, so
+// that every finding stays a test of the normal and sanitizer builds.
+#include <cstddef>
+#include <cstdint>
+#include <cstdio>
+#include <filesystem>
+#include <fstream>
+#include <iterator>
+#include <string>
+#include <vector>
+
+extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size);
+extern "C" __attribute__((weak)) int LLVMFuzzerInitialize(int* argc, char*** argv);
+
+int main(int argc, char** argv) {
+  // Gathered first: a target may change the working directory on start.
+  std::vector<std::filesystem::path> inputs;
+  for (int i = 1; i < argc; ++i) {
+    const std::filesystem::path arg = std::filesystem::absolute(argv[i]);
+    if (std::filesystem::is_directory(arg)) {
+      for (const auto& entry : std::filesystem::directory_iterator(arg)) {
+        if (entry.is_regular_file()) inputs.push_back(entry.path());
+      }
+    } else {
+      inputs.push_back(arg);
+    }
+  }
+  if (LLVMFuzzerInitialize) LLVMFuzzerInitialize(&argc, &argv);
+  for (const auto& path : inputs) {
+    std::ifstream f(path, std::ios::binary);
+    const std::string bytes((std::istreambuf_iterator<char>(f)), std::istreambuf_iterator<char>());
+    std::fprintf(stderr, "replaying %s\n", path.c_str());
+    LLVMFuzzerTestOneInput(reinterpret_cast<const uint8_t*>(bytes.data()), bytes.size());
+  }
+  std::fprintf(stderr, "%zu inputs replayed\n", inputs.size());
+  return inputs.empty() ? 1 : 0;
+}
