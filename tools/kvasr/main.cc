@@ -12,11 +12,13 @@
 
 #include "kvasr_offline.h"
 #include "transcribe.h"
+#include "vad_command.h"
 
 namespace {
 
 constexpr char kUsage[] =
     "usage: kvasr transcribe [options] FILE...\n"
+    "       kvasr vad [vad options] FILE...\n"
     "       kvasr version\n"
     "\n"
     "Transcribes WAV, FLAC or OGG files (any rate and channel count), or raw\n"
@@ -36,7 +38,21 @@ constexpr char kUsage[] =
     "  --max-silence-before-ms N, --max-silence-after-ms N\n"
     "                          end listening after this much silence (VAD on; 0: never)\n"
     "  --no-progress           no progress bar\n"
-    "  --verbose               show the library's log on standard error\n";
+    "  --verbose               show the library's log on standard error\n"
+    "\n"
+    "kvasr vad prints the speech segments that the voice activity detector\n"
+    "emits, start and end in seconds, one per line.\n"
+    "\n"
+    "vad options:\n"
+    "  --vad-models DIR        VAD model folder (default: the shipped one)\n"
+    "  --chunk-ms N            milliseconds of sound per call (default 100)\n"
+    "  --frames                one line per 10 ms frame instead: index, decision (0/1),\n"
+    "                          smoothed score, in an emitted segment (0/1)\n"
+    "  --plot OUT.png          draw waveform, smoothed score and segments (one input)\n"
+    "  --dump DIR              write DIR/<name>.f32 (the network's input rows, 39\n"
+    "                          floats a frame), <name>.tsv (per-frame record) and\n"
+    "                          <name>.stats (running normalisation statistics)\n"
+    "  --verbose               show the module's log on standard error\n";
 
 enum Option {
   kModel = 256, kVadModels, kNoVad, kPunct, kPunctSettings, kLang, kJson, kChunkMs,
@@ -124,11 +140,54 @@ int Transcribe(int argc, char** argv) {
   return kvasr_cli::RunTranscribe(o, TakeStdoutForResults(verbose));
 }
 
+int Vad(int argc, char** argv) {
+  enum VadOption { kVadDir = 256, kVadChunkMs, kFrames, kPlot, kDump, kVadVerbose, kVadHelp };
+  static const struct option kOptions[] = {
+      {"vad-models", required_argument, nullptr, kVadDir},
+      {"chunk-ms", required_argument, nullptr, kVadChunkMs},
+      {"frames", no_argument, nullptr, kFrames},
+      {"plot", required_argument, nullptr, kPlot},
+      {"dump", required_argument, nullptr, kDump},
+      {"verbose", no_argument, nullptr, kVadVerbose},
+      {"help", no_argument, nullptr, kVadHelp},
+      {nullptr, 0, nullptr, 0}};
+  kvasr_cli::VadOptions o;
+  bool verbose = false;
+  long n = 0;
+  int c;
+  while ((c = getopt_long(argc, argv, "", kOptions, nullptr)) != -1) {
+    switch (c) {
+      case kVadDir: o.vad_dir = optarg; break;
+      case kFrames: o.frames = true; break;
+      case kPlot: o.plot_path = optarg; break;
+      case kDump: o.dump_dir = optarg; break;
+      case kVadVerbose: verbose = true; break;
+      case kVadChunkMs:
+        if (!ParseInt(optarg, 1, 60000, &n)) {
+          std::fprintf(stderr, "kvasr: --chunk-ms takes milliseconds from 1 to 60000\n");
+          return 2;
+        }
+        o.chunk_ms = static_cast<int>(n);
+        break;
+      case kVadHelp: std::fputs(kUsage, stdout); return 0;
+      default: std::fputs(kUsage, stderr); return 2;
+    }
+  }
+  for (int i = optind; i < argc; ++i) o.inputs.push_back(argv[i]);
+  if (o.inputs.empty()) {
+    std::fputs("kvasr: no input given\n", stderr);
+    std::fputs(kUsage, stderr);
+    return 2;
+  }
+  return kvasr_cli::RunVadCommand(o, TakeStdoutForResults(verbose));
+}
+
 }  // namespace
 
 int main(int argc, char** argv) {
   const std::string command = argc > 1 ? argv[1] : "";
   if (command == "transcribe") return Transcribe(argc - 1, argv + 1);
+  if (command == "vad") return Vad(argc - 1, argv + 1);
   if (command == "version") {
     std::printf("kvasr %s\n", vorta_speech_get_offline_asr_version());
     return 0;

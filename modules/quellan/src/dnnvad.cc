@@ -224,9 +224,10 @@ int Cdnnvad::detect_speech(const float* feat) {
   for (int i = 0; i < frames; ++i) {
     m_smoothed = (1.0f - m_score_smooth) * m_out_score[i] +
                  m_score_smooth * m_smoothed;
-    const bool speech = m_smoothed > m_threshold &&
-                        (m_energy_gate != 1 || m_client_vad_flag[i] == 1);
+    const bool loud = m_energy_gate != 1 || m_client_vad_flag[i] == 1;
+    const bool speech = m_smoothed > m_threshold && loud;
     m_vad_flag[i] = speech ? 1 : 0;
+    if (m_observer != nullptr) report_frame(feat, i, loud, speech);
   }
   find_intervals();
   m_next_eval += (m_skip + 1) * m_score_num;
@@ -245,6 +246,15 @@ void Cdnnvad::fill_frame_scores() {
   }
   if (m_score_num > 0) m_last_score = m_skip_score[m_score_num - 1];
   for (; f <= m_last; ++f) out[f] = m_last_score;
+}
+
+void Cdnnvad::report_frame(const float* feat, int i, bool energy_speech,
+                           bool speech) const {
+  const int row = m_first + i;
+  m_observer->on_frame(VadFrameReport{
+      m_frame_base + row, feat + static_cast<size_t>(row) * m_feat_dim,
+      m_feat_dim, m_out_score[i], m_smoothed, energy_speech ? 1 : 0,
+      speech ? 1 : 0});
 }
 
 void Cdnnvad::find_intervals() {

@@ -41,6 +41,26 @@ struct VadOutputLists {
   int capacity;
 };
 
+// What the detector saw and decided for one frame.
+struct VadFrameReport {
+  int frame;              // absolute frame of the utterance
+  const float* features;  // the frame's feature row (feat_dim floats)
+  int feat_dim;
+  float score;            // network score the frame carries
+  float smoothed;         // smoothed score the decision compares
+  int energy_speech;      // energy gate's decision, 1 without the gate
+  int speech;             // the frame's decision
+};
+
+// Sees every frame once, in order, as the detector decides it. Used to
+// record training features and to inspect decisions; the detector runs the
+// same without one.
+class VadFrameObserver {
+ public:
+  virtual ~VadFrameObserver() = default;
+  virtual void on_frame(const VadFrameReport& report) = 0;
+};
+
 class Cdnnvad {
  public:
   // Throws std::runtime_error("init vad failed") after printing the reason.
@@ -54,6 +74,10 @@ class Cdnnvad {
                     const float* feat, int feat_dim, int plp_frames,
                     int tone_frames, int* consumed, const VadOutputLists& lists);
 
+  // Null (the default) switches observation off; the caller keeps the
+  // observer alive while it is set.
+  void set_frame_observer(VadFrameObserver* observer) { m_observer = observer; }
+
  private:
   struct DnnDeleter {
     void operator()(VadDnn* dnn) const { free_vaddnn(dnn); }
@@ -64,6 +88,8 @@ class Cdnnvad {
   int detect_speech(const float* feat);
   void fill_frame_scores();
   void find_intervals();
+  void report_frame(const float* feat, int i, bool energy_speech,
+                    bool speech) const;
   void segment_before_first_interval(const VadOutputLists& lists);
   void segment_between_intervals(const VadOutputLists& lists);
   void segment_after_last_interval(const VadOutputLists& lists);
@@ -107,6 +133,7 @@ class Cdnnvad {
   std::unique_ptr<int16_t[]> m_wav;
   int m_wav_len = 0;
   std::unique_ptr<uint8_t[]> m_client_vad_flag;
+  VadFrameObserver* m_observer = nullptr;
 };
 
 #endif  // QUELLAN_DNNVAD_H_

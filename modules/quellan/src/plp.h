@@ -42,6 +42,9 @@ class PLP {
   // normalisation.
   void reset() { cms_first_call_ = true; }
   bool first_call() const { return cms_first_call_; }
+  // Running statistics of the normalisation as the last block left them.
+  const std::vector<float>& running_mean() const { return run_mean_; }
+  const std::vector<float>& running_variance() const { return run_var_; }
 
  private:
   friend int load_base_info_cmsfp(PLP* plp, const PlpConfig* conf, FILE* cmsfp);

@@ -108,7 +108,11 @@ int Cquellan::reset() {
 }
 
 Cquellan::Interval Cquellan::emitted(int i) const {
-  return Interval{m_seg_beg[i], m_seg_end[i], out_wav[i].get(), m_out_len[i]};
+  const int* cuts = m_cut_frame.get();
+  const bool closes =
+      std::find(cuts, cuts + m_cut_num, m_seg_end[i]) != cuts + m_cut_num;
+  return Interval{m_seg_beg[i], m_seg_end[i], out_wav[i].get(), m_out_len[i],
+                  closes};
 }
 
 void Cquellan::append_history(const int16_t* samples, int len) {

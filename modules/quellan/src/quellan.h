@@ -19,6 +19,7 @@ class Cquellan {
     int end_frame;
     const int16_t* samples;
     int sample_count;
+    bool closes;  // the segment ends with this interval
   };
 
   // Throws std::runtime_error("init vad failed") after printing the reason.
@@ -38,6 +39,12 @@ class Cquellan {
   // Intervals emitted by the last call, in order.
   int emitted_count() const { return m_seg_num; }
   Interval emitted(int i) const;
+
+  // See Cdnnvad::set_frame_observer.
+  void set_frame_observer(VadFrameObserver* observer) {
+    m_vad->set_frame_observer(observer);
+  }
+  const PLP& feature_extractor() const { return *m_plp; }
 
  private:
   int extract_features(int index, int len, int* new_frames);

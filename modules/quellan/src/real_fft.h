@@ -16,8 +16,10 @@ class RealFft {
   int fft_n_;
   std::vector<double> re_;
   std::vector<double> im_;
-  std::vector<double> cos_table_;
-  std::vector<double> sin_table_;
+  // The stage of butterflies of length len keeps its twiddles
+  // exp(-2 pi i k / len), k < len / 2, at [len / 2, len).
+  std::vector<double> twiddle_re_;
+  std::vector<double> twiddle_im_;
   std::vector<int> bit_reverse_;
 };
 

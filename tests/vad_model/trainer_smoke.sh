@@ -1,0 +1,49 @@
+#!/bin/bash
+# A few training steps on a tiny sample of the corpus, through every stage of
+# training/vad/train.sh, ending with the module scoring frames exactly as the
+# trainer does with the network it wrote.
+#
+#   trainer_smoke.sh PYTHON KVASR FORWARD_TOOL CORPUS_DIR WORK_DIR
+set -euo pipefail
+python=$1 kvasr=$2 forward_tool=$3 corpus=$4 work=$5
+here=$(cd "$(dirname "$0")" && pwd)
+training=$here/../../training/vad
+skip=77
+
+if [ ! -f "$corpus/MANIFEST.tsv" ]; then
+  echo "corpus not found at $corpus: skipped"; exit $skip
+fi
+if ! "$python" -c "import numpy, soundfile" 2>/dev/null; then
+  echo "$python lacks numpy or soundfile: skipped"; exit $skip
+fi
+rm -rf "$work"
+mkdir -p "$work"
+cd "$work"
+for part in train val; do
+  "$python" "$training/mix.py" --corpus "$corpus" --part $part --out mix/$part \
+    --speech-mixtures 1 --nospeech-mixtures 1 --seconds 6
+done
+"$python" "$training/mean_table.py" seed seed
+mkdir -p pass1
+"$kvasr" vad --vad-models seed --dump pass1 mix/train/*.wav > /dev/null
+mkdir -p table
+"$python" "$training/mean_table.py" table pass1 table/quellan_data_a
+cp seed/quellan_data_b seed/quellan_data_c table/
+for part in train val; do
+  mkdir -p dump/$part
+  "$kvasr" vad --vad-models table --dump dump/$part mix/$part/*.wav > /dev/null
+done
+rows=$(ls dump/val/*.f32 | head -n 1)
+"$python" "$training/train.py" --mix mix --dump dump --table table/quellan_data_a \
+  --out model --hidden 8,4 --max-steps 60 --batch 64 \
+  --check-rows "$rows" --check-scores trainer_scores.f32
+for f in quellan_data_a quellan_data_b quellan_data_c; do
+  [ -s model/$f ] || { echo "model/$f missing"; exit 1; }
+done
+"$python" "$here/forward_check.py" trained "$forward_tool" model "$rows" trainer_scores.f32
+# The trained model runs in the whole pipeline, and what the dump records is
+# what that pipeline scored.
+mkdir -p deployed
+"$kvasr" vad --vad-models model --dump deployed mix/val/val_speech_clean_000.wav > /dev/null
+"$python" "$here/forward_check.py" deployed model deployed/val_speech_clean_000.f32 \
+  deployed/val_speech_clean_000.tsv

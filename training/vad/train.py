@@ -1,0 +1,156 @@
+"""Trains the detector's network on frames the pipeline itself produced.
+
+Inputs are the dumps of `kvasr vad --dump` over the train and val mixtures
+(the rows the network's inputs are spliced from) and the mixtures' labels.
+Writes quellan_data_b (network) and quellan_data_c (class priors, the label
+frequencies of the training frames) to --out, next to the given mean table,
+which it copies as quellan_data_a. With several --hidden choices it trains
+each and prints accuracy against cost on val, then keeps the one given by
+--keep.
+"""
+import argparse
+import json
+import os
+import shutil
+import time
+
+import numpy as np
+
+import frames
+import metrics
+import model_io
+import network
+
+SCORE_THRESHOLD = -1.0  # the detector's threshold on the smoothed score
+INPUT_SCALE_SAMPLE = 200000
+
+
+def parse_hidden(text):
+    return [int(h) for h in text.split(",") if h]
+
+
+def evaluate(net, priors, data, batch=65536):
+    scores = np.concatenate([
+        network.detector_scores(net.weights, net.biases, priors,
+                                data.inputs(slice(i, i + batch)))
+        for i in range(0, len(data), batch)])
+    acc = float(np.mean((scores > SCORE_THRESHOLD) == (data.labels == 1)))
+    return acc, metrics.roc_auc(scores, data.labels)
+
+
+def train_one(hidden, train, val, priors, args, rng):
+    sample = rng.choice(len(train), size=min(len(train), INPUT_SCALE_SAMPLE), replace=False)
+    x_sample = train.inputs(np.sort(sample))
+    mean = x_sample.mean(axis=0)
+    scale = x_sample.std(axis=0) + 1e-3
+    net = network.Network(x_sample.shape[1], hidden, rng)
+    opt = network.Adam(net.weights + net.biases, args.lr)
+    best = None
+    steps = 0
+    started = time.time()
+    for epoch in range(args.epochs):
+        order = rng.permutation(len(train))
+        losses = []
+        for i in range(0, len(order), args.batch):
+            which = np.sort(order[i:i + args.batch])
+            x = (train.inputs(which) - mean) / scale
+            loss, gw, gb = net.gradients(x.astype(np.float32), train.labels[which])
+            opt.step(gw + gb)
+            losses.append(loss)
+            steps += 1
+            if args.max_steps and steps >= args.max_steps:
+                break
+        opt.lr *= args.lr_decay
+        exported = network.Network(1, [], rng)
+        exported.weights = [w.copy() for w in net.weights]
+        exported.biases = [b.copy() for b in net.biases]
+        exported.fold_input_scaling(mean, scale)
+        acc, auc = evaluate(exported, priors, val)
+        print("hidden %s epoch %d: train loss %.4f, val accuracy %.4f, val AUC %.4f (%.0f s)"
+              % (hidden, epoch + 1, np.mean(losses), acc, auc, time.time() - started), flush=True)
+        if best is None or acc > best[0]:
+            best = (acc, auc, exported, epoch + 1)
+        if args.max_steps and steps >= args.max_steps:
+            break
+    return best
+
+
+def write_model(out_dir, table, net, priors):
+    os.makedirs(out_dir, exist_ok=True)
+    if os.path.abspath(table) != os.path.abspath(os.path.join(out_dir, "quellan_data_a")):
+        shutil.copyfile(table, os.path.join(out_dir, "quellan_data_a"))
+    model_io.write_network(os.path.join(out_dir, "quellan_data_b"), net.weights, net.biases)
+    model_io.write_priors(os.path.join(out_dir, "quellan_data_c"), priors)
+
+
+def main():
+    ap = argparse.ArgumentParser(description=__doc__,
+                                 formatter_class=argparse.RawDescriptionHelpFormatter)
+    ap.add_argument("--mix", required=True, help="folder with train/ and val/ mixtures")
+    ap.add_argument("--dump", required=True, help="folder with train/ and val/ dumps")
+    ap.add_argument("--table", required=True, help="the mean table the dumps were made with")
+    ap.add_argument("--out", required=True)
+    ap.add_argument("--hidden", action="append", default=None,
+                    help="hidden sizes, comma-separated; repeat to compare several")
+    ap.add_argument("--keep", default=None, help="which --hidden to write (default: the first)")
+    ap.add_argument("--epochs", type=int, default=4)
+    ap.add_argument("--batch", type=int, default=256)
+    ap.add_argument("--lr", type=float, default=2e-3)
+    ap.add_argument("--lr-decay", type=float, default=0.6)
+    ap.add_argument("--max-steps", type=int, default=0, help="stop after this many steps (smoke runs)")
+    ap.add_argument("--max-mixtures", type=int, default=0, help="use only this many mixtures per part")
+    ap.add_argument("--seed", type=int, default=1)
+    ap.add_argument("--report", help="write the comparison of sizes here (JSON)")
+    ap.add_argument("--check-rows", help="feature rows (float32, 39 a frame) of one utterance")
+    ap.add_argument("--check-scores", help="write the kept network's scores of --check-rows here")
+    args = ap.parse_args()
+    hidden_choices = args.hidden or ["32"]
+    keep = args.keep or hidden_choices[0]
+
+    rng = np.random.default_rng(args.seed)
+    sets = {}
+    for part in ("train", "val"):
+        names = frames.mixture_names(os.path.join(args.mix, part))
+        if args.max_mixtures:
+            names = names[:args.max_mixtures]
+        sets[part] = frames.FrameSet(os.path.join(args.mix, part),
+                                     os.path.join(args.dump, part), names)
+    train, val = sets["train"], sets["val"]
+    speech_share = float(np.mean(train.labels))
+    priors = np.array([1.0 - speech_share, speech_share], dtype=np.float32)
+    print("train frames %d (speech %.3f), val frames %d" % (len(train), speech_share, len(val)))
+
+    results = []
+    kept = None
+    for text in hidden_choices:
+        hidden = parse_hidden(text)
+        acc, auc, net, epoch = train_one(hidden, train, val, priors, args, rng)
+        cost = net.multiply_adds()
+        results.append({"hidden": text, "val_accuracy": acc, "val_auc": auc,
+                        "epoch": epoch, "multiply_adds_per_evaluation": cost})
+        if text == keep:
+            kept = net
+        if len(hidden_choices) > 1:
+            write_model(os.path.join(args.out, "hidden_" + text.replace(",", "x")),
+                        args.table, net, priors)
+    print("\nhidden\tval accuracy\tval AUC\tmultiply-adds per evaluation")
+    for r in results:
+        print("%s\t%.4f\t%.4f\t%d" % (r["hidden"], r["val_accuracy"], r["val_auc"],
+                                      r["multiply_adds_per_evaluation"]))
+    if kept is None:
+        raise SystemExit("--keep %s is not among --hidden" % keep)
+    write_model(args.out, args.table, kept, priors)
+    if args.report:
+        with open(args.report, "w") as f:
+            json.dump({"kept": keep, "priors": priors.tolist(), "train_frames": len(train),
+                       "val_frames": len(val), "results": results}, f, indent=1)
+    if args.check_rows:
+        # The network as held in memory, not as read back from the file.
+        rows = np.fromfile(args.check_rows, dtype="<f4").reshape(-1, frames.FEAT_DIM)
+        x = rows[frames.splice_index(len(rows))].reshape(len(rows), -1)
+        network.detector_scores(kept.weights, kept.biases, priors, x).astype("<f4").tofile(
+            args.check_scores)
+
+
+if __name__ == "__main__":
+    main()
