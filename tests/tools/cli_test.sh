@@ -47,6 +47,9 @@ common=(--model "$manifest" --no-vad)
 expect "a recording is transcribed" 0 "young man" - -- \
   "$kvasr" transcribe "${common[@]}" "$clip"
 
+expect "with the shipped VAD model" 0 "young man" - -- \
+  "$kvasr" transcribe --model "$manifest" "$clip"
+
 # 44.1 kHz stereo of the same recording: channel mixing and resampling.
 python3 -W ignore - "$clip" "$work/stereo44k.wav" <<'PY'
 import audioop, sys, wave
