@@ -1,0 +1,174 @@
+// Spelled numbers to digits with the shipped rule files.
+#include <gtest/gtest.h>
+
+#include <sstream>
+#include <string>
+#include <vector>
+
+#include "numbers.h"
+
+namespace kvasr {
+namespace punct {
+namespace {
+
+class NumbersTest : public testing::Test {
+ protected:
+  static void SetUpTestSuite() {
+    std::string error;
+    ASSERT_TRUE(rules_.Load(KVASR_PUNCT_MODEL_DIR "/num.txt", KVASR_PUNCT_MODEL_DIR "/xdb.txt", &error)) << error;
+  }
+
+  // `text` with the rules applied; '|' after a word stands for a mark the
+  // network put there.
+  static std::string Normalise(const std::string& text) {
+    std::vector<std::string> storage;
+    std::vector<bool> stop;
+    std::istringstream in(text);
+    std::string w;
+    while (in >> w) {
+      const bool marked = w.back() == '|';
+      if (marked) w.pop_back();
+      storage.push_back(w);
+      stop.push_back(marked);
+    }
+    std::vector<std::string_view> words(storage.begin(), storage.end());
+    std::vector<Span> spans;
+    std::string scratch;
+    rules_.Apply(words, stop, &spans, &scratch);
+    std::string out;
+    int expect_first = 0;
+    for (const Span& s : spans) {
+      EXPECT_EQ(s.first, expect_first) << text;
+      expect_first = s.last + 1;
+      if (!out.empty()) out += ' ';
+      out += s.number ? scratch.substr(s.text_offset, s.text_size) : storage[s.first];
+    }
+    EXPECT_EQ(expect_first, static_cast<int>(words.size())) << text;
+    return out;
+  }
+
+  static NumberRules rules_;
+};
+
+NumberRules NumbersTest::rules_;
+
+struct Case {
+  const char* in;
+  const char* out;
+};
+
+const Case kCases[] = {
+    // Two-word cardinals and teens.
+    {"twenty three", "23"}, {"ninety nine", "99"}, {"forty", "40"}, {"ten", "10"},
+    {"eleven", "11"}, {"nineteen", "19"}, {"twenty one people", "21 people"},
+    {"about thirty seven percent", "about 37 percent"},
+    // Hundreds, thousands, "and".
+    {"one hundred", "100"}, {"two hundred and five", "205"}, {"three hundred twelve", "312"},
+    {"nine hundred ninety nine", "999"}, {"one thousand", "1000"}, {"two thousand and ten", "2010"},
+    {"four thousand five hundred", "4500"}, {"twenty five hundred", "2500"},
+    {"ten thousand", "10,000"}, {"fifty thousand people", "50,000 people"},
+    {"one hundred twenty three thousand four hundred fifty six", "123,456"},
+    {"one million two hundred thousand", "1,200,000"},
+    {"a hundred and fifty", "150"}, {"a thousand and one nights", "1001 nights"},
+    // Round large numbers keep the scale word.
+    {"two million", "2 million"}, {"three hundred million", "300 million"},
+    {"seven billion people", "7 billion people"}, {"one trillion", "1 trillion"},
+    {"two point five billion", "2.5 billion"},
+    // Years and decades.
+    {"nineteen ninety five", "1995"}, {"in nineteen eighty four", "in 1984"},
+    {"twenty twelve", "2012"}, {"twenty ten", "2010"}, {"nineteen oh five", "1905"},
+    {"eighteen sixty", "1860"}, {"nineteen hundred", "1900"}, {"nineteen sixties", "1960s"},
+    {"two thousand and eight", "2008"}, {"fifteen hundred", "1500"},
+    // Decimals.
+    {"three point five", "3.5"}, {"zero point two", "0.2"}, {"three point one four", "3.14"},
+    {"one point oh five", "1.05"}, {"ninety nine point nine percent", "99.9 percent"},
+    // Ordinals.
+    {"twenty first century", "21st century"}, {"the twenty second", "the 22nd"},
+    {"the thirty third floor", "the 33rd floor"}, {"eleventh", "11th"}, {"twelfth", "12th"},
+    {"the hundredth time", "the hundredth time"}, {"one hundredth", "100th"}, {"fortieth birthday", "40th birthday"},
+    {"one hundred and first", "101st"}, {"the first time", "the first time"},
+    {"second place", "second place"},
+    // Small numbers and idioms stay in words.
+    {"one of them", "one of them"}, {"two people", "two people"}, {"no one", "no one"},
+    {"one another", "one another"}, {"zero", "zero"}, {"nine lives", "nine lives"},
+    {"one two three", "one two three"}, {"a hundred", "a hundred"}, {"a million dollars", "a million dollars"},
+    {"a thousand years", "a thousand years"}, {"hundreds of thousands", "hundreds of thousands"},
+    {"fifty fifty", "fifty fifty"}, {"twenty four seven", "twenty four seven"},
+    {"nine to five", "nine to five"}, {"thousands", "thousands"}, {"the sixties", "the sixties"},
+    {"point", "point"}, {"the point is", "the point is"}, {"hundred", "hundred"},
+    {"and", "and"}, {"oh no", "oh no"}, {"a lot", "a lot"},
+    // Where a number stops.
+    {"twenty three four", "23 four"}, {"one hundred and", "100 and"},
+    {"two thousand and", "2000 and"}, {"seven point", "seven point"},
+    {"thirty forty", "30 40"}, {"twenty eleven", "2011"},
+    {"million", "million"}, {"thousand two", "thousand two"},
+    // A mark the network placed inside splits the number.
+    {"twenty| three", "20 three"}, {"nineteen| ninety five", "19 95"},
+    {"one hundred| twenty", "100 20"}, {"three point| five", "three point five"},
+    // Not number words.
+    {"twentyish", "twentyish"}, {"tenth-grade", "tenth-grade"}, {"", ""},
+};
+
+TEST_F(NumbersTest, Table) {
+  for (const Case& c : kCases) EXPECT_EQ(Normalise(c.in), c.out) << "input: " << c.in;
+}
+
+// An independent speller: every number from 10 to 9999 said the long way
+// ("one thousand nine hundred ninety five") comes back as its digits.
+std::string Spell(int n) {
+  static const char* kUnits[] = {"zero",    "one",     "two",       "three",    "four",
+                                 "five",    "six",     "seven",     "eight",    "nine",
+                                 "ten",     "eleven",  "twelve",    "thirteen", "fourteen",
+                                 "fifteen", "sixteen", "seventeen", "eighteen", "nineteen"};
+  static const char* kTens[] = {"", "", "twenty", "thirty", "forty", "fifty", "sixty", "seventy", "eighty", "ninety"};
+  std::string s;
+  const auto add = [&](const std::string& w) { s += (s.empty() ? "" : " ") + w; };
+  if (n >= 1000) add(std::string(kUnits[n / 1000]) + " thousand"), n %= 1000;
+  if (n >= 100) add(std::string(kUnits[n / 100]) + " hundred"), n %= 100;
+  if (n >= 20) {
+    add(kTens[n / 10]);
+    if (n % 10) add(kUnits[n % 10]);
+  } else if (n > 0) {
+    add(kUnits[n]);
+  }
+  return s;
+}
+
+TEST_F(NumbersTest, EveryNumberFromTenTo9999) {
+  int failures = 0;
+  for (int n = 10; n < 10000 && failures < 10; ++n) {
+    const std::string got = Normalise(Spell(n));
+    if (got != std::to_string(n)) {
+      ADD_FAILURE() << Spell(n) << " -> " << got;
+      ++failures;
+    }
+  }
+}
+
+TEST_F(NumbersTest, EveryYearSaidInPairs) {
+  int failures = 0;
+  for (int year = 1110; year <= 2099 && failures < 10; ++year) {
+    const int high = year / 100, low = year % 100;
+    if (low < 10) continue;
+    const std::string spoken = Spell(high) + " " + Spell(low);
+    if (Normalise(spoken) != std::to_string(year)) {
+      ADD_FAILURE() << spoken << " -> " << Normalise(spoken);
+      ++failures;
+    }
+  }
+}
+
+TEST(NumberRulesLoad, RejectsBadFiles) {
+  NumberRules rules;
+  std::string error;
+  EXPECT_FALSE(rules.Load("/nonexistent/num.txt", "", &error));
+  EXPECT_NE(error.find("cannot open"), std::string::npos) << error;
+  // The xdb file is a vocabulary of phrases, not number words.
+  EXPECT_FALSE(rules.Load(KVASR_PUNCT_MODEL_DIR "/xdb.txt", "", &error));
+  EXPECT_FALSE(rules.Load(KVASR_PUNCT_MODEL_DIR "/num.txt", KVASR_PUNCT_MODEL_DIR "/num.txt", &error));
+  EXPECT_TRUE(rules.Load(KVASR_PUNCT_MODEL_DIR "/num.txt", "", &error)) << error;
+}
+
+}  // namespace
+}  // namespace punct
+}  // namespace kvasr
