@@ -50,6 +50,9 @@ expect "a recording is transcribed" 0 "young man" - -- \
 expect "with the shipped VAD model" 0 "young man" - -- \
   "$kvasr" transcribe --model "$manifest" "$clip"
 
+expect "punctuated with the shipped model" 0 "^He was not .*young man[.?!]$" - -- \
+  "$kvasr" transcribe "${common[@]}" --punct "$clip"
+
 # 44.1 kHz stereo of the same recording: channel mixing and resampling.
 python3 -W ignore - "$clip" "$work/stereo44k.wav" <<'PY'
 import audioop, sys, wave
