@@ -9,6 +9,7 @@
 #include <cstdlib>
 #include <cstring>
 #include <string>
+#include <vector>
 
 #include "kvasr_offline.h"
 #include "transcribe.h"
@@ -68,6 +69,25 @@ bool ParseInt(const char* text, long min, long max, long* out) {
   return true;
 }
 
+bool ParseChunkMs(const char* text, int* chunk_ms) {
+  long n = 0;
+  if (!ParseInt(text, 1, 60000, &n)) {
+    std::fprintf(stderr, "kvasr: --chunk-ms takes milliseconds from 1 to 60000\n");
+    return false;
+  }
+  *chunk_ms = static_cast<int>(n);
+  return true;
+}
+
+// The arguments after the options; false, with the usage, when there are none.
+bool CollectInputs(int argc, char** argv, std::vector<std::string>* inputs) {
+  for (int i = optind; i < argc; ++i) inputs->push_back(argv[i]);
+  if (!inputs->empty()) return true;
+  std::fputs("kvasr: no input given\n", stderr);
+  std::fputs(kUsage, stderr);
+  return false;
+}
+
 // The library logs on standard output; keep that stream for the texts and
 // send the log to standard error, or nowhere.
 FILE* TakeStdoutForResults(bool verbose) {
@@ -112,11 +132,7 @@ int Transcribe(int argc, char** argv) {
       case kNoProgress: o.progress = false; break;
       case kVerbose: verbose = true; break;
       case kChunkMs:
-        if (!ParseInt(optarg, 1, 60000, &n)) {
-          std::fprintf(stderr, "kvasr: --chunk-ms takes milliseconds from 1 to 60000\n");
-          return 2;
-        }
-        o.chunk_ms = static_cast<int>(n);
+        if (!ParseChunkMs(optarg, &o.chunk_ms)) return 2;
         break;
       case kSilenceBefore:
       case kSilenceAfter:
@@ -131,12 +147,7 @@ int Transcribe(int argc, char** argv) {
       default: std::fputs(kUsage, stderr); return 2;
     }
   }
-  for (int i = optind; i < argc; ++i) o.inputs.push_back(argv[i]);
-  if (o.inputs.empty()) {
-    std::fputs("kvasr: no input given\n", stderr);
-    std::fputs(kUsage, stderr);
-    return 2;
-  }
+  if (!CollectInputs(argc, argv, &o.inputs)) return 2;
   return kvasr_cli::RunTranscribe(o, TakeStdoutForResults(verbose));
 }
 
@@ -153,7 +164,6 @@ int Vad(int argc, char** argv) {
       {nullptr, 0, nullptr, 0}};
   kvasr_cli::VadOptions o;
   bool verbose = false;
-  long n = 0;
   int c;
   while ((c = getopt_long(argc, argv, "", kOptions, nullptr)) != -1) {
     switch (c) {
@@ -163,22 +173,13 @@ int Vad(int argc, char** argv) {
       case kDump: o.dump_dir = optarg; break;
       case kVadVerbose: verbose = true; break;
       case kVadChunkMs:
-        if (!ParseInt(optarg, 1, 60000, &n)) {
-          std::fprintf(stderr, "kvasr: --chunk-ms takes milliseconds from 1 to 60000\n");
-          return 2;
-        }
-        o.chunk_ms = static_cast<int>(n);
+        if (!ParseChunkMs(optarg, &o.chunk_ms)) return 2;
         break;
       case kVadHelp: std::fputs(kUsage, stdout); return 0;
       default: std::fputs(kUsage, stderr); return 2;
     }
   }
-  for (int i = optind; i < argc; ++i) o.inputs.push_back(argv[i]);
-  if (o.inputs.empty()) {
-    std::fputs("kvasr: no input given\n", stderr);
-    std::fputs(kUsage, stderr);
-    return 2;
-  }
+  if (!CollectInputs(argc, argv, &o.inputs)) return 2;
   return kvasr_cli::RunVadCommand(o, TakeStdoutForResults(verbose));
 }
 
