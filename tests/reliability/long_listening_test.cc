@@ -107,7 +107,11 @@ TEST(LongListeningTest, HoursOfSpeechAndPausesInOnePeriod) {
                "%.2f h fed in %d cycles: %zu segments, RSS %ld KiB after the first cycle, %ld KiB "
                "at the end\n",
                hours, cycles, segments.size(), rss_start, rss_end);
+#if !defined(__SANITIZE_ADDRESS__) && !defined(__SANITIZE_THREAD__)
+  // Sanitizer runtimes hold freed memory back for a while, so only a plain
+  // build shows what the engine itself keeps.
   EXPECT_LE(rss_end - rss_start, 1024) << "KiB grown";
+#endif
   // Every clip's speech reaches the decoder in every cycle, as in the first.
   for (int c = 1; c < cycles; ++c) {
     EXPECT_EQ(segments_per_cycle[c], segments_per_cycle[1]) << "cycle " << c;
