@@ -41,6 +41,11 @@ for f in quellan_data_a quellan_data_b quellan_data_c; do
   [ -s model/$f ] || { echo "model/$f missing"; exit 1; }
 done
 "$python" "$here/forward_check.py" trained "$forward_tool" model "$rows" trainer_scores.f32
+before=$(od -An -tx1 model/quellan_data_c)
+"$python" "$training/tune_priors.py" --kvasr "$kvasr" --model model --mix mix/val \
+  --work priors --thresholds -1 1 > priors.txt
+grep -q "^kept threshold log-odds" priors.txt || { cat priors.txt; exit 1; }
+[ "$(od -An -tx1 model/quellan_data_c)" != "$before" ] || { echo "priors not rewritten"; exit 1; }
 # The trained model runs in the whole pipeline, and what the dump records is
 # what that pipeline scored.
 mkdir -p deployed
