@@ -99,5 +99,31 @@ expect "bad chunk size" 2 - "chunk-ms" -- "$kvasr" transcribe "${common[@]}" --c
 expect "no input" 2 - "no input given" -- "$kvasr" transcribe "${common[@]}"
 expect "unknown command" 2 - "usage" -- "$kvasr" frobnicate
 
+# Half a second of faint noise, then a second of a 200 Hz harmonic complex.
+python3 - "$work/tone200.wav" <<'PY'
+import math, random, struct, sys, wave
+random.seed(1)
+x = [random.randint(-5, 5) for _ in range(8000)]
+x += [int(12000 * sum(math.cos(2 * math.pi * h * 200 * i / 16000) / h for h in range(1, 20)) / 3.5)
+      for i in range(16000)]
+with wave.open(sys.argv[1], "wb") as w:
+    w.setnchannels(1); w.setsampwidth(2); w.setframerate(16000)
+    w.writeframes(struct.pack("<%dh" % len(x), *x))
+PY
+expect "pitch of a synthetic 200 Hz tone" 0 "^100	(19[6-9]|20[0-4])\.[0-9]+$" - -- \
+  "$kvasr" pitch "$work/tone200.wav"
+expect "pitch track of a recording" 0 "^# frame	f0_hz; .*t = 0.01\*i - 0.01003125 s" - -- \
+  "$kvasr" pitch "$clip"
+total=$((total + 1))
+frames=$(grep -vc '^#' "$work/out")
+voiced=$(grep -v '^#' "$work/out" | awk '$2 >= 60 && $2 <= 450' | wc -l)
+if [ "$frames" -lt 100 ] || [ "$voiced" -lt $((frames / 10)) ]; then
+  echo "FAIL pitch track of a recording: $frames frames, $voiced voiced"
+  failures=$((failures + 1))
+fi
+expect "pitch of a missing file" 1 - "^kvasr: $work/missing.wav: .+" -- \
+  "$kvasr" pitch "$work/missing.wav"
+expect "pitch takes one file" 2 - "one input file" -- "$kvasr" pitch "$clip" "$clip"
+
 echo "$((total - failures)) passed, $failures failed"
 [ "$failures" -eq 0 ]

@@ -12,6 +12,7 @@
 #include <vector>
 
 #include "kvasr_offline.h"
+#include "pitch_command.h"
 #include "transcribe.h"
 #include "vad_command.h"
 
@@ -20,6 +21,7 @@ namespace {
 constexpr char kUsage[] =
     "usage: kvasr transcribe [options] FILE...\n"
     "       kvasr vad [vad options] FILE...\n"
+    "       kvasr pitch FILE\n"
     "       kvasr version\n"
     "\n"
     "Transcribes WAV, FLAC or OGG files (any rate and channel count), or raw\n"
@@ -53,7 +55,11 @@ constexpr char kUsage[] =
     "  --dump DIR              write DIR/<name>.f32 (the network's input rows, 39\n"
     "                          floats a frame), <name>.tsv (per-frame record) and\n"
     "                          <name>.stats (running normalisation statistics)\n"
-    "  --verbose               show the module's log on standard error\n";
+    "  --verbose               show the module's log on standard error\n"
+    "\n"
+    "kvasr pitch prints the raw pitch track of one recording: frame index and\n"
+    "frequency in Hz (0: unvoiced), one line per 10 ms frame, after a '#' line\n"
+    "that gives the time of each frame.\n";
 
 enum Option {
   kModel = 256, kVadModels, kNoVad, kPunct, kPunctSettings, kLang, kJson, kChunkMs,
@@ -183,12 +189,26 @@ int Vad(int argc, char** argv) {
   return kvasr_cli::RunVadCommand(o, TakeStdoutForResults(verbose));
 }
 
+int Pitch(int argc, char** argv) {
+  if (argc == 2 && std::strcmp(argv[1], "--help") == 0) {
+    std::fputs(kUsage, stdout);
+    return 0;
+  }
+  if (argc != 2 || argv[1][0] == '\0') {
+    std::fputs("kvasr: pitch takes one input file\n", stderr);
+    std::fputs(kUsage, stderr);
+    return 2;
+  }
+  return kvasr_cli::RunPitchCommand(argv[1], TakeStdoutForResults(false));
+}
+
 }  // namespace
 
 int main(int argc, char** argv) {
   const std::string command = argc > 1 ? argv[1] : "";
   if (command == "transcribe") return Transcribe(argc - 1, argv + 1);
   if (command == "vad") return Vad(argc - 1, argv + 1);
+  if (command == "pitch") return Pitch(argc - 1, argv + 1);
   if (command == "version") {
     std::printf("kvasr %s\n", vorta_speech_get_offline_asr_version());
     return 0;

@@ -38,6 +38,12 @@ int load_vad_dnn_conf(const char* dir, int32_t max_frames, VadDnnConf* conf) {
   return 0;
 }
 
+int load_pitch_conf(const char* /*path*/, PitchConf* conf) {
+  conf->tone_dim = 3;
+  conf->tone_scale = 10.0f;
+  return 0;
+}
+
 int load_quellan_conf(const char* dir, QuellanConf* conf) {
   conf->max_frames = 13000;
   conf->feat_dim = 39;
@@ -49,6 +55,10 @@ int load_quellan_conf(const char* dir, QuellanConf* conf) {
                 dir != nullptr ? dir : "./data");
   if (plp_load_conf(&conf->plp, conf->max_frames, dir, nullptr) < 0) {
     QUELLAN_WARN("Failed to load plp conf.\n");
+    return -1;
+  }
+  if (conf->use_pitch != 0 && load_pitch_conf(dir, &conf->pitch) < 0) {
+    QUELLAN_WARN("Failed to load pitch conf.\n");
     return -1;
   }
   if (load_vad_dnn_conf(dir, conf->max_frames, &conf->vad) < 0) {

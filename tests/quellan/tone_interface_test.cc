@@ -1,0 +1,237 @@
+#include "Vortaf0Interface.h"
+
+#include <gtest/gtest.h>
+
+#include <cmath>
+#include <map>
+#include <memory>
+#include <string>
+#include <vector>
+
+#include "model_files.h"
+#include "pipeline_harness.h"
+#include "quellan.h"
+
+namespace {
+
+constexpr int kRate = 16000;
+constexpr int kToneDim = 3;
+constexpr float kSentinel = -777.0f;
+
+PitchConf Conf(float scale = 10.0f) {
+  PitchConf conf{};
+  EXPECT_EQ(load_pitch_conf(nullptr, &conf), 0);
+  EXPECT_EQ(conf.tone_dim, kToneDim);
+  EXPECT_EQ(conf.tone_scale, 10.0f);
+  conf.tone_scale = scale;
+  return conf;
+}
+
+// Faint noise with a rising harmonic complex from 0.3 s to 1.3 s.
+std::vector<int16_t> GlideAudio(int seconds) {
+  std::vector<int16_t> x(static_cast<size_t>(seconds) * kRate);
+  unsigned seed = 99;
+  double phase = 0.0;
+  for (size_t i = 0; i < x.size(); ++i) {
+    seed = seed * 1103515245u + 12345u;
+    double v = static_cast<int>((seed >> 16) % 21) - 10;
+    if (i >= 4800 && i < 20800) {
+      const double f0 = 140.0 + 80.0 * (i - 4800) / 16000.0;
+      phase += 2.0 * M_PI * f0 / kRate;
+      for (int h = 1; h <= 12; ++h) v += 4000.0 / h * std::sin(h * phase);
+    }
+    x[i] = static_cast<int16_t>(std::lround(v));
+  }
+  return x;
+}
+
+struct ToneRun {
+  std::vector<float> features;  // stride kToneDim
+  std::vector<float> raw;
+  int frames = 0;
+};
+
+// Feeds `audio` in chunks of the given sizes (cycled), then ends the stream.
+ToneRun RunTone(const std::vector<int16_t>& audio, const std::vector<int>& chunks,
+                float scale = 10.0f) {
+  auto tone = std::make_unique<Vortaf0Interface>(Conf(scale), 0);
+  tone->SetToneFeatureOffset(0);
+  ToneRun run;
+  const int capacity = static_cast<int>(audio.size()) / 160 + 1;
+  run.features.assign(static_cast<size_t>(capacity) * kToneDim, kSentinel);
+  run.raw.resize(static_cast<size_t>(capacity));
+  size_t pos = 0;
+  int raw_total = 0;
+  for (size_t c = 0; pos < audio.size(); ++c) {
+    const int len = std::min<int>(chunks[c % chunks.size()],
+                                  static_cast<int>(audio.size() - pos));
+    int written = -1;
+    int raw_count = -1;
+    EXPECT_EQ(tone->ExtractToneFeature(
+                  audio.data() + pos, len, run.features.data() + run.frames * kToneDim,
+                  capacity - run.frames, &written, run.raw.data() + raw_total,
+                  capacity - raw_total, &raw_count),
+              0);
+    run.frames += written;
+    raw_total += raw_count;
+    pos += static_cast<size_t>(len);
+  }
+  int flushed = -1;
+  EXPECT_EQ(tone->EndToneFeature(run.features.data() + run.frames * kToneDim,
+                                 capacity - run.frames, &flushed),
+            0);
+  run.frames += flushed;
+  run.raw.resize(static_cast<size_t>(raw_total));
+  return run;
+}
+
+// However the stream is cut into calls, the frames are the stream's
+// consecutive 160-sample frames: 159 + 1 makes one frame, and 100 pending
+// samples + 400 make frames pending + 0..59, 60..219 and 220..379 with 20
+// samples left.
+TEST(ToneInterfaceFraming, AnyChunkingMatchesWholeFrames) {
+  const std::vector<int16_t> audio = GlideAudio(2);
+  const ToneRun whole = RunTone(audio, {160});
+  ASSERT_GT(whole.frames, 150);
+  ASSERT_GT(whole.raw.size(), 150u);
+  const std::vector<std::vector<int>> cuts = {
+      {159, 1}, {100, 400}, {1}, {0, 320, 7}, {4000}, {161, 159, 3}};
+  for (const auto& cut : cuts) {
+    const ToneRun run = RunTone(audio, cut);
+    EXPECT_EQ(run.frames, whole.frames) << cut[0];
+    EXPECT_EQ(run.features, whole.features) << cut[0];
+    EXPECT_EQ(run.raw, whole.raw) << cut[0];
+  }
+}
+
+int Occurrences(const std::string& log, const std::string& line) {
+  int n = 0;
+  for (size_t at = log.find(line); at != std::string::npos; at = log.find(line, at + 1)) ++n;
+  return n;
+}
+
+// A full raw-f0 array fails the call before any analysis; a full output
+// matrix drops each ready frame with a report, and the call succeeds.
+TEST(ToneInterfaceLimits, FullOutputsReportAndDrop) {
+  const std::vector<int16_t> audio = GlideAudio(1);
+  auto tone = std::make_unique<Vortaf0Interface>(Conf(), 0);
+  float raw[4];
+  int written = -5, raw_count = -5;
+  testing::internal::CaptureStdout();
+  EXPECT_EQ(tone->ExtractToneFeature(audio.data(), 800, nullptr, 0, &written, raw, 0,
+                                     &raw_count),
+            -1);
+  const std::string failure = testing::internal::GetCapturedStdout();
+  EXPECT_EQ(failure.rfind("WARNING * [modules/quellan/src/Vortaf0Interface.cc:", 0), 0u)
+      << failure;
+  EXPECT_EQ(Occurrences(failure, "<<ExtractToneFeature>>] Too many frames for raw f0. [0/0].\n"),
+            1);
+  EXPECT_EQ(written, -5);
+  EXPECT_EQ(raw_count, -5);
+
+  tone = std::make_unique<Vortaf0Interface>(Conf(), 0);
+  float cell = kSentinel;
+  testing::internal::CaptureStdout();
+  EXPECT_EQ(tone->ExtractToneFeature(audio.data(), kRate, &cell, 0, &written, nullptr, 0,
+                                     nullptr),
+            0);
+  const std::string log = testing::internal::GetCapturedStdout();
+  EXPECT_EQ(written, 0);
+  EXPECT_EQ(cell, kSentinel);
+  // 100 frames, two of them only fill the buffer, 27 held back.
+  EXPECT_EQ(Occurrences(log, "<<GetToneFeature>>] Two many Frames for tone. [0/0].\n"),
+            100 - 2 - 27);
+}
+
+// Values land at k * stride + offset + d, scaled by 10; the fourth value
+// and the other columns stay untouched.
+TEST(ToneInterfaceLayout, OffsetStrideAndScale) {
+  const std::vector<int16_t> audio = GlideAudio(2);
+  const ToneRun packed = RunTone(audio, {160});
+  auto tone = std::make_unique<Vortaf0Interface>(Conf(), 0);
+  const int base = 5, stride = base + kToneDim;
+  tone->SetToneFeatureOffset(base);
+  EXPECT_EQ(tone->GetToneFeatureDim(), kToneDim);
+  std::vector<float> matrix(static_cast<size_t>(packed.frames + 1) * stride, kSentinel);
+  int written = 0, flushed = 0;
+  ASSERT_EQ(tone->ExtractToneFeature(audio.data(), static_cast<int>(audio.size()),
+                                     matrix.data(), packed.frames + 1, &written,
+                                     nullptr, 0, nullptr),
+            0);
+  ASSERT_EQ(tone->EndToneFeature(matrix.data() + written * stride,
+                                 packed.frames + 1 - written, &flushed),
+            0);
+  EXPECT_EQ(flushed, 27);
+  ASSERT_EQ(written + flushed, packed.frames);
+  for (int k = 0; k <= packed.frames; ++k) {
+    for (int c = 0; c < stride; ++c) {
+      const float got = matrix[static_cast<size_t>(k) * stride + c];
+      if (k == packed.frames || c < base) {
+        EXPECT_EQ(got, kSentinel) << k << "," << c;
+      } else {
+        EXPECT_EQ(got, packed.features[static_cast<size_t>(k) * kToneDim + c - base])
+            << k << "," << c;
+      }
+    }
+  }
+  const ToneRun unscaled = RunTone(audio, {160}, 1.0f);
+  ASSERT_EQ(unscaled.frames, packed.frames);
+  for (size_t i = 0; i < static_cast<size_t>(packed.frames) * kToneDim; ++i) {
+    EXPECT_EQ(packed.features[i], 10.0f * unscaled.features[i]) << i;
+  }
+}
+
+// Records the row the detector sees for every frame.
+class RowRecorder : public VadFrameObserver {
+ public:
+  void on_frame(const VadFrameReport& report) override {
+    rows[report.frame].assign(report.features, report.features + report.feat_dim);
+  }
+  std::map<int, std::vector<float>> rows;
+};
+
+TEST(ToneInterfacePipeline, ToneColumnsFollowThePlpColumns) {
+  const std::string plain_dir = quellan_test::MakeModelDir(10.0f);
+  const std::string tone_dir = quellan_test::MakeTempDir();
+  const int row = 39 + kToneDim;
+  quellan_test::WriteNetwork(tone_dir + "/quellan_data_b",
+                             quellan_test::ConstantNetwork(row * 11, 10.0f));
+  quellan_test::WritePriors(tone_dir + "/quellan_data_c", {1.0f, 1.0f});
+  quellan_test::WriteMeanTable(tone_dir + "/quellan_data_a", std::vector<float>(39, 0.0f),
+                               std::vector<float>(39, 1.0f));
+  QuellanConf tone_conf = quellan_test::PipelineConf(tone_dir, false);
+  tone_conf.use_pitch = 1;
+  ASSERT_EQ(load_pitch_conf(tone_dir.c_str(), &tone_conf.pitch), 0);
+  Cquellan with_tone(tone_conf);
+  Cquellan plain(quellan_test::PipelineConf(plain_dir, false));
+  RowRecorder tone_rows, plain_rows;
+  with_tone.set_frame_observer(&tone_rows);
+  plain.set_frame_observer(&plain_rows);
+
+  // 100 samples past the last full frame give PLP one row more than the
+  // tone track, whose last frame is then repeated.
+  std::vector<int16_t> audio = GlideAudio(3);
+  audio.insert(audio.end(), 100, 3);
+  testing::internal::CaptureStdout();
+  quellan_test::RunUtterance(&with_tone, audio, 1600);
+  quellan_test::RunUtterance(&plain, audio, 1600);
+  EXPECT_EQ(testing::internal::GetCapturedStdout().find("WARNING"), std::string::npos);
+
+  const ToneRun reference = RunTone(audio, {1600});
+  ASSERT_EQ(tone_rows.rows.size(), plain_rows.rows.size());
+  ASSERT_EQ(static_cast<int>(tone_rows.rows.size()), reference.frames + 1);
+  for (const auto& [frame, values] : tone_rows.rows) {
+    ASSERT_EQ(values.size(), static_cast<size_t>(row));
+    const std::vector<float>& plp = plain_rows.rows.at(frame);
+    ASSERT_EQ(plp.size(), 39u);
+    EXPECT_TRUE(std::equal(plp.begin(), plp.end(), values.begin())) << frame;
+    // The tone track is padded to the PLP length with its last frame.
+    const int source = std::min(frame, reference.frames - 1);
+    for (int d = 0; d < kToneDim; ++d) {
+      EXPECT_EQ(values[39 + d], reference.features[static_cast<size_t>(source) * kToneDim + d])
+          << frame << "," << d;
+    }
+  }
+}
+
+}  // namespace
