@@ -18,7 +18,6 @@ constexpr int kDeltaWindowFrames = 2;
 constexpr float kDeltaDivisor = 10.0f;  // 2 * (1^2 + 2^2)
 constexpr float kFilterbankFloor = 1.0f;
 constexpr double kMinStdDev = 0.01;
-constexpr uint16_t kOutsideBand = 65535;
 
 double mel(double hz) { return 1127.0 * std::log(1.0 + hz / 700.0); }
 
@@ -85,16 +84,21 @@ void PLP::build_tables() {
   for (int i = 1; i <= num_chans + 1; ++i) {
     centre[i] = static_cast<double>(i) / (num_chans + 1) * (mhi - mlo) + mlo;
   }
-  bin_chan_.assign(half_n + 1, kOutsideBand);
+  std::vector<int> bin_chan(half_n + 1, 0);
   bin_weight_.assign(half_n + 1, 0.0f);
-  for (int k = 1; k <= half_n; ++k) {
-    if (k < first_bin_ || k > last_bin_) continue;
+  for (int k = first_bin_; k <= last_bin_; ++k) {
     const double m = 1127.0 * std::log(1.0 + (k - 1) * bin_mel_step);
     int ch = 0;
     while (ch + 1 <= num_chans + 1 && centre[ch + 1] < m) ++ch;
-    bin_chan_[k] = static_cast<uint16_t>(ch);
+    bin_chan[k] = ch;
     bin_weight_[k] = static_cast<float>((centre[ch + 1] - m) /
                                         (centre[ch + 1] - centre[ch]));
+  }
+  // Channels rise with the bin, so each one's bins form a range; walking
+  // down leaves the first bin at or above every channel.
+  chan_first_bin_.assign(num_chans + 2, last_bin_ + 1);
+  for (int k = last_bin_; k >= first_bin_; --k) {
+    for (int c = 0; c <= bin_chan[k]; ++c) chan_first_bin_[c] = k;
   }
 
   loudness_.assign(num_chans + 1, 0.0f);
@@ -107,14 +111,18 @@ void PLP::build_tables() {
   }
 
   const int n_freq = num_chans + 2;
-  idft_cos_.assign(conf_.lpc_order + 1, std::vector<double>(n_freq + 1, 0.0));
-  for (int k = 0; k <= conf_.lpc_order; ++k) {
-    std::vector<double>& row = idft_cos_[k];
+  const int lags = conf_.lpc_order + 1;
+  idft_cos_.assign(static_cast<size_t>(n_freq) * lags, 0.0);
+  for (int k = 0; k < lags; ++k) {
     const double step = k * M_PI / (n_freq - 1);
-    row[1] = 1.0;
-    for (int j = 1; j <= n_freq - 2; ++j) row[j + 1] = 2.0 * std::cos(j * step);
-    row[n_freq] = std::cos((n_freq - 1) * step);
+    idft_cos_[k] = 1.0;
+    for (int j = 1; j <= n_freq - 2; ++j) {
+      idft_cos_[static_cast<size_t>(j) * lags + k] = 2.0 * std::cos(j * step);
+    }
+    idft_cos_[static_cast<size_t>(n_freq - 1) * lags + k] =
+        std::cos((n_freq - 1) * step);
   }
+  lag_sums_.assign(lags, 0.0);
 
   lifter_.assign(conf_.num_ceps + 1, 1.0f);
   if (conf_.cep_lifter > 0) {
@@ -140,7 +148,8 @@ void PLP::build_tables() {
   cep_.assign(static_dim_ + 1, 0.0f);
 }
 
-int PLP::AddWaveData(const int16_t* waveData, int smpNum) {
+int PLP::AddWaveData(const int16_t* waveData, int smpNum,
+                     int64_t first_sample) {
   if (m_bInitialize_ != 1 || waveData == nullptr || smpNum <= 0) {
     QUELLAN_WARN("Null m_bInitialize[%lx] or waveData[%p] or smpNum[%d]\n",
                  static_cast<unsigned long>(m_bInitialize_),
@@ -153,6 +162,8 @@ int PLP::AddWaveData(const int16_t* waveData, int smpNum) {
                  conf_.max_frame_num);
     return -1;
   }
+  const int kept = take_over_kept_frames(first_sample, smpNum);
+  kept_start_ = kNoPosition;
   // The mean is removed from the copy of each frame, not from the caller's
   // block, which the pipeline keeps as overlap for the next block.
   double mean = 0.0;
@@ -160,7 +171,7 @@ int PLP::AddWaveData(const int16_t* waveData, int smpNum) {
     for (int i = 0; i < smpNum; ++i) mean += waveData[i];
     mean /= smpNum;
   }
-  for (int t = 0; t < frame_num_; ++t) {
+  for (int t = kept; t < frame_num_; ++t) {
     const int16_t* samples = waveData + static_cast<size_t>(t) * frame_shift_;
     // A block shorter than one window still counts one frame (the frame
     // count truncates toward zero); its missing samples read as zeros.
@@ -180,24 +191,48 @@ int PLP::AddWaveData(const int16_t* waveData, int smpNum) {
   return 0;
 }
 
+int PLP::take_over_kept_frames(int64_t first_sample, int smpNum) {
+  // The block mean ties every frame to the whole block.
+  if (first_sample < 0 || kept_start_ < 0 || conf_.zero_mean_src) return 0;
+  const int64_t offset_samples = first_sample - kept_start_;
+  if (offset_samples < 0 || offset_samples % frame_shift_ != 0) return 0;
+  const int64_t offset_frames = offset_samples / frame_shift_;
+  // Only whole frames repeat: a block shorter than a window pads its frame.
+  const int whole_frames = smpNum >= frame_size_ ? frame_num_ : 0;
+  const int count = static_cast<int>(
+      std::clamp<int64_t>(kept_frames_ - offset_frames, 0, whole_frames));
+  if (count == 0) return 0;
+  std::memmove(static_buf_.get(),
+               static_buf_.get() + offset_frames * static_dim_,
+               sizeof(float) * static_cast<size_t>(count) * static_dim_);
+  return count;
+}
+
 void PLP::analyse_frame(float* cepstrum) {
   float* x = frame_.data();
+  // Pre-emphasis and window in one pass, backwards so that x[i - 1] is
+  // still the sample when x[i] needs it.
   for (int i = frame_size_; i >= 2; --i) {
-    x[i] = static_cast<float>(x[i] - kPreEmphasis * x[i - 1]);
+    x[i] = static_cast<float>(x[i] - kPreEmphasis * x[i - 1]) * hamming_[i];
   }
-  x[1] = static_cast<float>(x[1] * (1.0 - kPreEmphasis));
-  for (int i = 1; i <= frame_size_; ++i) x[i] *= hamming_[i];
+  x[1] = static_cast<float>(x[1] * (1.0 - kPreEmphasis)) * hamming_[1];
   // spectrum_[k - 1] is the magnitude of filterbank bin k.
   fft_->magnitude(x + 1, spectrum_.data());
 
   const int num_chans = conf_.num_chans;
-  std::fill(fbank_.begin(), fbank_.end(), 0.0f);
-  for (int k = first_bin_; k <= last_bin_; ++k) {
-    const float e = spectrum_[k - 1];
-    const int ch = bin_chan_[k];
-    const float w = bin_weight_[k] * e;
-    if (ch > 0) fbank_[ch] += w;
-    if (ch < num_chans) fbank_[ch + 1] += e - w;
+  // Channel j rises over the bins of range j - 1 and falls over those of
+  // range j, summed in bin order; a register sum per channel keeps the adds
+  // out of memory.
+  for (int j = 1; j <= num_chans; ++j) {
+    float sum = 0.0f;
+    for (int k = chan_first_bin_[j - 1]; k < chan_first_bin_[j]; ++k) {
+      const float e = spectrum_[k - 1];
+      sum += e - bin_weight_[k] * e;
+    }
+    for (int k = chan_first_bin_[j]; k < chan_first_bin_[j + 1]; ++k) {
+      sum += bin_weight_[k] * spectrum_[k - 1];
+    }
+    fbank_[j] = sum;
   }
 
   const int n_freq = num_chans + 2;
@@ -209,17 +244,16 @@ void PLP::analyse_frame(float* cepstrum) {
   aud_spec_[1] = aud_spec_[2];
   aud_spec_[n_freq] = aud_spec_[n_freq - 1];
 
-  float energy = 0.0f;
-  for (int k = 0; k <= conf_.lpc_order; ++k) {
-    double sum = 0.0;
-    for (int i = 1; i <= n_freq; ++i) sum += aud_spec_[i] * idft_cos_[k][i];
-    const float r = static_cast<float>(sum / (2.0 * (n_freq - 1)));
-    if (k == 0) {
-      energy = r;
-    } else {
-      ac_[k] = r;
-    }
+  const int lags = conf_.lpc_order + 1;
+  std::fill(lag_sums_.begin(), lag_sums_.end(), 0.0);
+  for (int i = 1; i <= n_freq; ++i) {
+    const double a = aud_spec_[i];
+    const double* cosines = idft_cos_.data() + static_cast<size_t>(i - 1) * lags;
+    for (int k = 0; k < lags; ++k) lag_sums_[k] += a * cosines[k];
   }
+  const double scale = 2.0 * (n_freq - 1);
+  const float energy = static_cast<float>(lag_sums_[0] / scale);
+  for (int k = 1; k < lags; ++k) ac_[k] = static_cast<float>(lag_sums_[k] / scale);
   lp_[conf_.lpc_order + 1] = 0.0f;
   const float err = durbin(energy);
 
@@ -260,8 +294,9 @@ float PLP::durbin(float energy) {
 }
 
 int PLP::extract_feature(const int16_t* wave, int smpNum, float* out,
-                         int max_out_frames, int* out_frames, int flag) {
-  if (AddWaveData(wave, smpNum) != 0) {
+                         int max_out_frames, int* out_frames, int flag,
+                         int64_t first_sample) {
+  if (AddWaveData(wave, smpNum, first_sample) != 0) {
     QUELLAN_WARN("Failed to add wave data.\n");
     return -1;
   }
@@ -292,6 +327,11 @@ int PLP::extract_feature(const int16_t* wave, int smpNum, float* out,
                 sizeof(float) * feat_dim);
   }
   *out_frames = frames;
+  // After the last block the caller may start over at the same positions.
+  if (first_sample >= 0 && flag >= 1 && smpNum >= frame_size_) {
+    kept_start_ = first_sample;
+    kept_frames_ = frames;
+  }
   return 0;
 }
 

@@ -19,18 +19,29 @@ int load_base_info_cmsfp(PLP* plp, const PlpConfig* conf, FILE* cmsfp);
 
 class PLP {
  public:
+  // A block that is not placed in an utterance.
+  static constexpr int64_t kNoPosition = -1;
+
   // `cmsfp` is the open mean table, or null when cms_mode is 0. Throws
   // std::runtime_error("init vad failed") after printing the reason.
   PLP(const PlpConfig* conf, FILE* cmsfp);
 
-  // Frames and analyses one block into the static cepstra.
-  int AddWaveData(const int16_t* waveData, int smpNum);
+  // Frames and analyses one block into the static cepstra, taking over the
+  // frames that extract_feature kept at the same positions (see there).
+  int AddWaveData(const int16_t* waveData, int smpNum,
+                  int64_t first_sample = kNoPosition);
 
   // Writes one normalised feature vector per frame of the block to `out`
   // (stride feat_dim + out_pad). `flag` >= 1 while more audio follows, below
   // 1 on the last block; -1 alone enables the short-utterance rule.
+  // `first_sample`, when given, is where the block starts in the utterance
+  // begun by reset(): the static cepstra of a block that more audio follows
+  // are kept, and the next block takes over the frames at the same positions
+  // instead of analysing them again. The caller must not change the samples
+  // at a position within an utterance. Returns 0 or -1.
   int extract_feature(const int16_t* wave, int smpNum, float* out,
-                      int max_out_frames, int* out_frames, int flag);
+                      int max_out_frames, int* out_frames, int flag,
+                      int64_t first_sample = kNoPosition);
 
   int frame_shift_samples() const { return frame_shift_; }
   int window_samples() const { return frame_size_; }
@@ -39,8 +50,11 @@ class PLP {
   int delay_frames() const;
   void set_out_pad(int out_pad) { conf_.out_pad = out_pad; }
   // Marks the next block as the first of an utterance for the running
-  // normalisation.
-  void reset() { cms_first_call_ = true; }
+  // normalisation; frames kept from the last one are no longer taken over.
+  void reset() {
+    cms_first_call_ = true;
+    kept_start_ = kNoPosition;
+  }
   bool first_call() const { return cms_first_call_; }
   // Running statistics of the normalisation as the last block left them.
   const std::vector<float>& running_mean() const { return run_mean_; }
@@ -50,6 +64,9 @@ class PLP {
   friend int load_base_info_cmsfp(PLP* plp, const PlpConfig* conf, FILE* cmsfp);
 
   void build_tables();
+  // Moves the kept frames that the block starting at `first_sample` repeats
+  // to the front of static_buf_; returns how many.
+  int take_over_kept_frames(int64_t first_sample, int smpNum);
   // Turns the samples in frame_[1 .. frame_size] into one static vector.
   void analyse_frame(float* cepstrum);
   // Levinson-Durbin recursion on ac_; returns the prediction error.
@@ -70,12 +87,17 @@ class PLP {
 
   // Filterbank and analysis tables; vectors are indexed from 1 where the
   // formulas count from 1.
-  std::vector<uint16_t> bin_chan_;
   std::vector<float> bin_weight_;
   int first_bin_ = 0;
   int last_bin_ = 0;
+  // Bins [chan_first_bin_[c], chan_first_bin_[c + 1]) lie between the
+  // centres of channels c and c + 1.
+  std::vector<int> chan_first_bin_;
   std::vector<float> loudness_;
-  std::vector<std::vector<double>> idft_cos_;
+  // idft_cos_[(i - 1) * (lpc_order + 1) + k]: weight of frequency i at lag
+  // k, so the lags of one frequency sit side by side.
+  std::vector<double> idft_cos_;
+  std::vector<double> lag_sums_;
   std::vector<float> lifter_;
   std::vector<float> hamming_;
   std::unique_ptr<RealFft> fft_;
@@ -90,6 +112,10 @@ class PLP {
   std::vector<float> cep_;
 
   std::unique_ptr<float[]> static_buf_;  // static_dim x max_frame_num
+  // Utterance position of the first frame kept in static_buf_, and how many
+  // whole frames follow it there.
+  int64_t kept_start_ = kNoPosition;
+  int kept_frames_ = 0;
   std::unique_ptr<float[]> m_tgt_;       // feat_dim x max_frame_num
 
   // Cepstral mean table and the running statistics seeded from it.

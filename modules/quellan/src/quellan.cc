@@ -36,20 +36,11 @@ Cquellan::Cquellan(const QuellanConf& conf)
     QUELLAN_WARN("Invalid pipeline settings.\n");
     throw std::runtime_error("init vad failed");
   }
-  if (conf.use_pitch != 0) {
-    QUELLAN_WARN("failed to new Vortaf0Interface.\n");
-    throw std::runtime_error("init vad failed");
-  }
   m_wav_history = alloc_zeroed<int16_t>(static_cast<size_t>(m_history_capacity));
   wav_reserve = alloc_zeroed<int16_t>(static_cast<size_t>(m_wav_capacity));
   if (!m_wav_history || !wav_reserve) {
     // Established wording, although it names another object.
     QUELLAN_WARN("failed to new Vortaf0Interface.\n");
-    throw std::runtime_error("init vad failed");
-  }
-  m_feat = alloc_zeroed<float>(static_cast<size_t>(m_max_frames) * m_feat_dim);
-  if (!m_feat) {
-    QUELLAN_WARN("failed to alloc m_feat.\n");
     throw std::runtime_error("init vad failed");
   }
   FILE* cmsfp = nullptr;
@@ -76,7 +67,30 @@ Cquellan::Cquellan(const QuellanConf& conf)
                  m_plp_dim, m_frame_shift, m_feat_dim, conf.frame_shift);
     throw std::runtime_error("init vad failed");
   }
-  m_vad = std::make_unique<Cdnnvad>(conf.vad);
+  m_use_tone = conf.use_pitch;
+  if (m_use_tone != 0) {
+    try {
+      m_tone = std::make_unique<Vortaf0Interface>(conf.pitch, m_wav_capacity);
+    } catch (const std::bad_alloc&) {
+      QUELLAN_WARN("failed to new Vortaf0Interface.\n");
+      throw std::runtime_error("init vad failed");
+    }
+    // Tone columns follow the PLP columns of each row.
+    m_tone->SetToneFeatureOffset(conf.plp.feat_dim);
+    m_tone_dim = m_tone->GetToneFeatureDim();
+    m_plp->set_out_pad(m_tone_dim);
+    m_feat_dim += m_tone_dim;
+  }
+  // Allocated once the row width is known.
+  m_feat = alloc_zeroed<float>(static_cast<size_t>(m_max_frames) * m_feat_dim);
+  if (!m_feat) {
+    QUELLAN_WARN("failed to alloc m_feat.\n");
+    throw std::runtime_error("init vad failed");
+  }
+  VadDnnConf vad_conf = conf.vad;
+  // The network reads whole rows, tone columns included.
+  vad_conf.feat_dim += m_tone_dim;
+  m_vad = std::make_unique<Cdnnvad>(vad_conf);
 
   out_wav.resize(out_wav_num);
   for (int i = 0; i < out_wav_num; ++i) {
@@ -98,7 +112,9 @@ Cquellan::Cquellan(const QuellanConf& conf)
 
 int Cquellan::reset() {
   m_wav_len = 0;
+  m_wav_start = 0;
   m_plp_frames = 0;
+  m_tone_frames = 0;
   m_history_len = 0;
   m_open_calls = 0;
   m_seg_num = 0;
@@ -169,7 +185,7 @@ int Cquellan::extract_features(int index, int len, int* new_frames) {
   float* free_rows = m_feat.get() + static_cast<size_t>(m_plp_frames) * m_feat_dim;
   if (m_plp->extract_feature(wav_reserve.get(), buffered, free_rows,
                              m_max_frames - m_plp_frames, &produced,
-                             index) < 0) {
+                             index, m_wav_start) < 0) {
     QUELLAN_WARN("failed to extract plp feature.\n");
     return -1;
   }
@@ -177,10 +193,12 @@ int Cquellan::extract_features(int index, int len, int* new_frames) {
   const int overlap_frames = 2 * m_plp_delay;
   if (index > 0) {
     // The last delay rows still lack right context; the next block starts
-    // early enough to bring them, and the rows they depend on, again.
+    // early enough to bring them, and the rows they depend on, again (PLP
+    // takes their static cepstra over rather than analysing them twice).
     rows -= m_plp_delay;
     const int keep_from = (rows - overlap_frames) * m_frame_shift;
     m_wav_len = buffered - keep_from;
+    m_wav_start += keep_from;
     std::memmove(wav_reserve.get(), wav_reserve.get() + keep_from,
                  sizeof(int16_t) * m_wav_len);
   }
@@ -194,6 +212,47 @@ int Cquellan::extract_features(int index, int len, int* new_frames) {
     }
   }
   *new_frames = rows;
+  return 0;
+}
+
+int Cquellan::extract_tone(int index, const int16_t* samples, int len,
+                           int plp_frames) {
+  if (index == 1 || index == -1) m_tone->ResetToneFeature();
+  float* free_rows = m_feat.get() + static_cast<size_t>(m_tone_frames) * m_feat_dim;
+  const int free_count = m_max_frames - m_tone_frames;
+  int added = 0;
+  if (m_tone->ExtractToneFeature(samples, len, free_rows, free_count, &added,
+                                 nullptr, 0, nullptr) < 0) {
+    QUELLAN_WARN("Failed to ExtractToneFeature.\n");
+    return -1;
+  }
+  int flushed = 0;
+  if (index < 0 &&
+      m_tone->EndToneFeature(free_rows + static_cast<size_t>(added) * m_feat_dim,
+                             free_count - added, &flushed) < 0) {
+    QUELLAN_WARN("Failed to EndToneFeature.\n");
+    return -1;
+  }
+  if (plp_frames < m_tone_frames + added + flushed) {
+    QUELLAN_WARN("plp_len[%d] < tone_flen[%d].\n", plp_frames,
+                 m_tone_frames + added + flushed);
+    return -1;
+  }
+  m_tone_frames += added + flushed;
+  // Mid-stream the tone rows lag behind by the post-processing delay and the
+  // detector waits for them; at the end the track is padded to the PLP
+  // length by repeating its last frame.
+  if (index < 0) {
+    for (; m_tone_frames < plp_frames; ++m_tone_frames) {
+      float* dst = m_feat.get() + static_cast<size_t>(m_tone_frames) * m_feat_dim +
+                   m_plp_dim;
+      if (m_tone_frames == 0) {
+        std::fill_n(dst, m_tone_dim, 0.0f);
+      } else {
+        std::memcpy(dst, dst - m_feat_dim, sizeof(float) * m_tone_dim);
+      }
+    }
+  }
   return 0;
 }
 
@@ -220,21 +279,28 @@ int Cquellan::quellan_process(int index, const int16_t* samples, int len,
   // the detector refuses; the stored count must stay a valid row number.
   const int plp_frames = m_plp_frames + new_frames;
   m_plp_frames = std::max(plp_frames, 0);
+  if (m_use_tone != 0) {
+    if (extract_tone(index, samples, len, plp_frames) < 0) return -1;
+  } else {
+    m_tone_frames = m_plp_frames;
+  }
 
   int consumed = 0;
   const VadOutputLists lists{&m_cut_num, m_cut_frame.get(), &m_seg_num,
                              m_seg_beg.get(), m_seg_end.get(), out_wav_num};
   if (m_vad->add_wave_data(index, samples, len, m_feat.get(), m_feat_dim,
-                           plp_frames, plp_frames, &consumed, lists) < 0 ||
+                           plp_frames, m_tone_frames, &consumed, lists) < 0 ||
       consumed < 0) {
     QUELLAN_WARN("failed to add wave data.\n");
     return -1;
   }
+  const int filled_rows = std::max(m_plp_frames, m_tone_frames);
   std::memmove(m_feat.get(),
                m_feat.get() + static_cast<size_t>(consumed) * m_feat_dim,
-               sizeof(float) * static_cast<size_t>(m_plp_frames - consumed) *
+               sizeof(float) * static_cast<size_t>(filled_rows - consumed) *
                    m_feat_dim);
   m_plp_frames -= consumed;
+  m_tone_frames -= consumed;
 
   for (int i = 1; i < m_seg_num; ++i) m_seg_beg[i] = m_seg_end[i - 1] + 1;
 

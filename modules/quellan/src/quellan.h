@@ -10,6 +10,7 @@
 
 #include "dnnvad.h"
 #include "plp.h"
+#include "Vortaf0Interface.h"
 #include "quellan_conf.h"
 
 class Cquellan {
@@ -48,6 +49,9 @@ class Cquellan {
 
  private:
   int extract_features(int index, int len, int* new_frames);
+  // Writes the chunk's tone rows after the PLP columns; `plp_frames` is the
+  // PLP row count after this chunk. Returns 0 or -1.
+  int extract_tone(int index, const int16_t* samples, int len, int plp_frames);
   void append_history(const int16_t* samples, int len);
   // Limits samples [begin, end) of the utterance to those the ring holds.
   void clip_to_history(int64_t* begin, int64_t* end) const;
@@ -58,6 +62,7 @@ class Cquellan {
   int m_max_frames;
   std::unique_ptr<int16_t[]> wav_reserve;  // audio not yet turned into rows
   int m_wav_len = 0;
+  int64_t m_wav_start = 0;  // position of wav_reserve[0] in the utterance
   int m_wav_capacity;
   int m_frame_shift = 0;
   std::unique_ptr<float[]> m_feat;  // rows not yet consumed by the detector
@@ -66,6 +71,10 @@ class Cquellan {
   int m_plp_dim = 0;
   int m_plp_frames = 0;
   int m_plp_delay = 0;
+  int m_use_tone = 0;
+  std::unique_ptr<Vortaf0Interface> m_tone;  // null without tone features
+  int m_tone_dim = 0;                         // tone columns per row
+  int m_tone_frames = 0;                      // rows that hold tone values
   std::unique_ptr<Cdnnvad> m_vad;
   // Ring of the latest audio at its position in the utterance; long enough
   // for every interval the detector can still report.

@@ -13,6 +13,10 @@ class RealFft {
   void magnitude(const float* frame, float* magnitude);
 
  private:
+  // Loads the frame in bit-reversed order and runs the butterfly stages of
+  // length 2 and 4, which see only real values.
+  void first_stages(const float* frame);
+
   int fft_n_;
   std::vector<double> re_;
   std::vector<double> im_;
