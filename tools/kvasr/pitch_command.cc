@@ -11,7 +11,6 @@ namespace kvasr_cli {
 namespace {
 
 constexpr int kFrameSamples = 160;  // 10 ms at 16 kHz
-constexpr float kPeriodRateHz = 8000.0f;  // raw periods count 8 kHz samples
 constexpr size_t kReadSamples = 16000;
 
 }  // namespace
@@ -56,7 +55,7 @@ int RunPitchCommand(const std::string& input, FILE* out) {
       int written = 0;
       tracker->ExtractToneFeature(samples.data() + used, kFrameSamples, tone.data(), 1,
                                   &written, &period, 1, &raw_count);
-      const float hz = raw_count == 1 && period > 0.0f ? kPeriodRateHz / period : 0.0f;
+      const float hz = raw_count == 1 && period > 0.0f ? kPitchSampleRateHz / period : 0.0f;
       std::fprintf(out, "%ld\t%.2f\n", frame, hz);
     }
   }

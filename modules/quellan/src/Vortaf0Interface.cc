@@ -8,7 +8,6 @@
 
 namespace {
 
-constexpr float kSilentLogEnergy = -50.0f;
 // Stands in a raw pitch slot until the tracker writes a decision over it.
 constexpr float kRawF0Marker = FLT_MAX;
 

@@ -13,7 +13,6 @@ constexpr int kFftSize = 256;
 constexpr int kLastBin = kPowerBins - 1;
 // The window's 2 pi is the single-precision constant, widened.
 constexpr double kTwoPi = 6.2831854820251465;
-constexpr float kSilentLogEnergy = -50.0f;
 constexpr double kMinEnergy = 0.00019284;
 constexpr double kMinPitchLogEnergy = 13.6;
 

@@ -4,10 +4,11 @@
 #include <cmath>
 #include <cstring>
 
+#include "tone_post.h"
+
 namespace {
 
-constexpr float kSampleRateHz = 8000.0f;
-constexpr float kBinHz = kSampleRateHz / 256.0f;  // 256-point transform
+constexpr float kBinHz = kPitchSampleRateHz / 256.0f;  // 256-point transform
 constexpr float kFilteredRateHz = 2000.0f;
 constexpr int kLastBin = kPowerBins - 1;
 
@@ -254,7 +255,7 @@ float PitchTrackingEstimate(PitchTrackingState* s,
   const bool trusted = s->distrust_frames == 0 &&
                        s->track_frames >= kTrackFramesForTrust &&
                        s->tracked_period > 0.0f;
-  const float tracked_hz = trusted ? kSampleRateHz / s->tracked_period : 0.0f;
+  const float tracked_hz = trusted ? kPitchSampleRateHz / s->tracked_period : 0.0f;
   float best_hz = 0.0f;
   float best_score = 0.0f;
   for (int c = 0; c < candidate_count; ++c) {
@@ -280,7 +281,7 @@ float PitchTrackingEstimate(PitchTrackingState* s,
     PitchTrackingBreak(s);
     return 0.0f;
   }
-  s->tracked_period = kSampleRateHz / f0_hz;
+  s->tracked_period = kPitchSampleRateHz / f0_hz;
   ++s->track_frames;
   return s->tracked_period;
 }

@@ -8,7 +8,6 @@
 
 namespace {
 
-constexpr float kSilentLogEnergy = -50.0f;
 // Window position of the frame being selected; the newer ones are look-ahead.
 constexpr int kSelectCentre = 10;
 constexpr float kPitchNeighbourRatio = 1.28f;
@@ -16,7 +15,6 @@ constexpr float kRepairOuterRatio = 1.4f;
 // An octave fold by two is undone when its error is not clearly below the
 // plain ratio of the two pitches.
 constexpr float kFoldBiasFactor = 1.4f;
-constexpr float kSampleRateHz = 8000.0f;
 constexpr float kReferenceHz = 185.0f;
 constexpr int kInterpLookAhead = 6;
 constexpr int kNormCurrent = 95;
@@ -238,7 +236,7 @@ void ToneStatePush(ToneState* s, float pitch_period, float log_energy) {
   PushWindow(s->energy_win, log_energy);
   PushWindow(s->smooth3, SelectPitch(s));
   const float period = RepairMiddle(s->smooth3);
-  PushWindow(s->interp7, period == 0.0f ? 0.0f : kSampleRateHz / period);
+  PushWindow(s->interp7, period == 0.0f ? 0.0f : kPitchSampleRateHz / period);
   PushWindow(s->norm101, InterpolateGap(s));
   PushWindow(s->avg5, s->norm101[kNormCurrent] - NonZeroMean(s->norm101));
   PushWindow(s->delta13, NonZeroMean(s->avg5));

@@ -5,6 +5,12 @@
 
 #include <cstdint>
 
+// A silent or unanalysed frame enters the post-processing as pitch 0 with
+// this log energy.
+constexpr float kSilentLogEnergy = -50.0f;
+// Pitch values are periods in samples of the tracker's 8 kHz signal.
+constexpr float kPitchSampleRateHz = 8000.0f;
+
 constexpr int kToneValuesPerFrame = 4;
 constexpr int kToneDelayFrames = 27;
 constexpr int kToneOutFloats = 2000;
