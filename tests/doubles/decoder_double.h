@@ -13,7 +13,6 @@ struct Call {
   std::string name;
   std::vector<int64_t> args;      // integer arguments in order (handle excluded)
   std::vector<int16_t> samples;   // mwSetData only
-  bool null_samples = false;      // mwSetData only
   std::string model;              // mwDecoderInit only: the file's content
 };
 
@@ -39,7 +38,6 @@ void SetInitFails(bool fails);
 void SetStartResult(int result);
 // Results of the following mwSetData calls, in order; 0 once exhausted.
 void QueueSetDataResult(int result);
-void SetVersion(const char* version);  // null is allowed
 
 // Events fired during the next call of mwSetData / mwStopDecode (one batch per call).
 void QueueOnSetData(std::vector<Event> batch);

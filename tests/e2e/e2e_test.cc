@@ -93,23 +93,6 @@ class EndToEnd : public testing::Test {
   void* engine_ = nullptr;
 };
 
-TEST_F(EndToEnd, PartialTextsThenOneFinalPerUtterance) {
-  ASSERT_TRUE(Init(false));
-  const std::vector<Message> messages = Listen(kvasr_test::LibrivoxClip("0880"));
-  ASSERT_FALSE(messages.empty());
-  int finals = 0;
-  for (size_t i = 0; i < messages.size(); ++i) {
-    EXPECT_EQ(messages[i].status, 0);
-    EXPECT_FALSE(messages[i].text.empty());
-    if (messages[i].is_break) ++finals;
-    if (i > 0) {
-      EXPECT_NE(messages[i].text, messages[i - 1].text) << "repeated partial";
-    }
-  }
-  EXPECT_EQ(finals, 1);
-  EXPECT_TRUE(messages.back().is_break);
-}
-
 TEST_F(EndToEnd, LibrivoxWordErrorRateWithoutVad) {
   ASSERT_TRUE(Init(false));
   const auto [errors, words] = Errors("without VAD");

@@ -96,16 +96,6 @@ TEST_F(CApiTest, PacketSignDecidesTheLastChunk) {
   }
 }
 
-TEST_F(CApiTest, BadSoundArgumentsAreRefused) {
-  InitAndStart(Collect, &context_);
-  const int16_t s[1] = {0};
-  decoder_double::ClearCalls();
-  EXPECT_EQ(vorta_speech_offline_asr_process_sound_data(engine_, nullptr, 1, 0), -1);
-  EXPECT_EQ(vorta_speech_offline_asr_process_sound_data(engine_, s, 0, 0), -1);
-  EXPECT_EQ(vorta_speech_offline_asr_process_sound_data(engine_, s, -1, 0), -1);
-  EXPECT_TRUE(decoder_double::Calls().empty());
-}
-
 TEST_F(CApiTest, NullCallbackDropsResults) {
   InitAndStart(nullptr, &context_);
   decoder_double::QueueOnSetData({decoder_double::Result("abc", 1)});

@@ -48,6 +48,13 @@ class EngineTest : public testing::Test {
     decoder_double::ClearCalls();
   }
 
+  // Feeds one sample while the decoder reports `results`; returns the log.
+  std::string Decode(std::vector<decoder_double::Event> results) {
+    decoder_double::QueueOnSetData(std::move(results));
+    const uint16_t sample = 0;
+    return Stdout([&] { EXPECT_TRUE(engine_.ProcessSoundData(&sample, 1, 0)); });
+  }
+
   std::vector<decoder_double::Call> SetDataCalls() const {
     std::vector<decoder_double::Call> out;
     for (const auto& c : decoder_double::Calls()) {
@@ -305,31 +312,12 @@ TEST_F(EngineTest, SoundIsRefusedOutsideTheStartedState) {
   EXPECT_TRUE(decoder_double::Calls().empty());
 }
 
-TEST_F(EngineTest, WithoutVadChunksReachTheDecoderUnchanged) {
-  Started("");
-  const uint16_t s[3] = {1, 0x8000, 3};
-  EXPECT_TRUE(engine_.ProcessSoundData(s, 3, 5));
-  EXPECT_TRUE(engine_.ProcessSoundData(s, 2, -7));
-  const auto calls = SetDataCalls();
-  ASSERT_EQ(calls.size(), 2u);
-  EXPECT_EQ(calls[0].samples, (std::vector<int16_t>{1, -32768, 3}));
-  EXPECT_EQ(calls[0].args, (std::vector<int64_t>{3, 0}));
-  EXPECT_EQ(calls[1].args, (std::vector<int64_t>{2, 1}));
-
-  decoder_double::QueueSetDataResult(-3);
-  EXPECT_EQ(Stdout([&] { EXPECT_FALSE(engine_.ProcessSoundData(s, 3, 0)); }),
-            "moxwing set data failed: -3\n");
-}
-
 // ---- Results --------------------------------------------------------------
 
 TEST_F(EngineTest, ResultsBecomeCompactSortedJson) {
   Started("");
-  decoder_double::QueueOnSetData({decoder_double::Result("ab", 0), decoder_double::Result("abc", 1),
-                                  decoder_double::Result("say \"hi\" \\ ok", 0),
-                                  decoder_double::Result("na\xc3\xafve", 0)});
-  const uint16_t s = 0;
-  Stdout([&] { ASSERT_TRUE(engine_.ProcessSoundData(&s, 1, 0)); });
+  Decode({decoder_double::Result("ab", 0), decoder_double::Result("abc", 1),
+          decoder_double::Result("say \"hi\" \\ ok", 0), decoder_double::Result("na\xc3\xafve", 0)});
   ASSERT_EQ(messages_.size(), 4u);
   EXPECT_EQ(messages_[0], R"({"message":"Success","result":{"isBreak":false,"text":"ab"},"status":0})");
   EXPECT_EQ(messages_[1], kResultFinalAbc);
@@ -350,9 +338,7 @@ TEST_F(EngineTest, TextsThatAreNotUtf8StillGiveValidJson) {
   };
   for (const auto& c : cases) {
     messages_.clear();
-    decoder_double::QueueOnSetData({decoder_double::Result(c.first, 1)});
-    const uint16_t s = 0;
-    Stdout([&] { ASSERT_TRUE(engine_.ProcessSoundData(&s, 1, 0)); });
+    Decode({decoder_double::Result(c.first, 1)});
     ASSERT_EQ(messages_.size(), 1u);
     EXPECT_EQ(messages_[0], R"({"message":"Success","result":{"isBreak":true,"text":")" + c.second +
                                 R"("},"status":0})");
@@ -361,9 +347,8 @@ TEST_F(EngineTest, TextsThatAreNotUtf8StillGiveValidJson) {
 
 TEST_F(EngineTest, FinalTextsArePunctuatedAndPartialTextsLoggedAsSkipped) {
   Started(R"(,"local_punc_settings":{"model_path":"m"})");
-  decoder_double::QueueOnSetData({decoder_double::Result("hello", 0), decoder_double::Result("hello there", 1)});
-  const uint16_t s = 0;
-  const std::string log = Stdout([&] { ASSERT_TRUE(engine_.ProcessSoundData(&s, 1, 0)); });
+  const std::string log =
+      Decode({decoder_double::Result("hello", 0), decoder_double::Result("hello there", 1)});
   EXPECT_EQ(log, "asr result:hello\nOfflineAsrEngineImpl->punc failed: hello\nasr result:hello there\n");
   ASSERT_EQ(messages_.size(), 2u);
   EXPECT_EQ(messages_[0], R"({"message":"Success","result":{"isBreak":false,"text":"hello"},"status":0})");
@@ -375,24 +360,12 @@ TEST_F(EngineTest, PuncAllPunctuatesPartialsAndFailuresKeepTheText) {
   Started(R"(,"local_punc_settings":{"punc_all":true})");
   punctuator_double::QueueReply({0, 5, "Ab, c"});
   punctuator_double::QueueReply({2, 0, ""});
-  decoder_double::QueueOnSetData({decoder_double::Result("ab c", 0), decoder_double::Result("abc", 1)});
-  const uint16_t s = 0;
-  const std::string log = Stdout([&] { ASSERT_TRUE(engine_.ProcessSoundData(&s, 1, 0)); });
+  const std::string log =
+      Decode({decoder_double::Result("ab c", 0), decoder_double::Result("abc", 1)});
   EXPECT_NE(log.find("OfflineAsrEngineImpl->punc failed: abc\n"), std::string::npos);
   ASSERT_EQ(messages_.size(), 2u);
   EXPECT_EQ(messages_[0], R"({"message":"Success","result":{"isBreak":false,"text":"Ab, c"},"status":0})");
   EXPECT_EQ(messages_[1], kResultFinalAbc);
-}
-
-TEST_F(EngineTest, ResultsWithoutASinkAreDroppedBeforePunctuation) {
-  Stdout([&] {
-    ASSERT_TRUE(engine_.Init(InitParams(R"(,"local_punc_settings":{"punc_all":true})")));
-    ASSERT_TRUE(engine_.AsrStart(R"({"asr":{}})", nullptr, nullptr));
-  });
-  decoder_double::QueueOnSetData({decoder_double::Result("abc", 1)});
-  const uint16_t s = 0;
-  Stdout([&] { ASSERT_TRUE(engine_.ProcessSoundData(&s, 1, 0)); });
-  EXPECT_EQ(punctuator_double::Count("punctuator_do_it"), 0);
 }
 
 // ---- Audio path with VAD ---------------------------------------------------
@@ -454,16 +427,6 @@ TEST_F(EngineTest, FirstSpeechSwitchesToTheAfterVoiceLimit) {
   Stdout([&] { EXPECT_FALSE(engine_.ProcessSoundData(chunk.data(), 400, 0)); });
   ASSERT_EQ(messages_.size(), 1u);
   EXPECT_EQ(messages_[0], kTimeout);
-}
-
-TEST_F(EngineTest, TimeOutWithoutASinkStillStops) {
-  Stdout([&] {
-    ASSERT_TRUE(engine_.Init(InitParams(R"(,"vad_enabled":true)")));
-    ASSERT_TRUE(engine_.AsrStart(R"({"asr":{"max_mute_time_before_voice":10}})", nullptr, nullptr));
-  });
-  std::vector<uint16_t> chunk(160, 0);
-  Stdout([&] { EXPECT_FALSE(engine_.ProcessSoundData(chunk.data(), 160, 0)); });
-  EXPECT_EQ(engine_.state(), 1);
 }
 
 TEST_F(EngineTest, StopClearsTheSilenceCount) {

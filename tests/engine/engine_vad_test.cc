@@ -103,20 +103,6 @@ TEST_F(EngineVadTest, OnlySpeechReachesTheDecoderInCompletedSegments) {
   EXPECT_TRUE(messages_.empty());
 }
 
-TEST_F(EngineVadTest, SilenceAfterSpeechEndsTheListeningPeriod) {
-  Start(R"({"max_mute_time_before_voice":3000,"max_mute_time_after_voice":1000})");
-  std::vector<uint16_t> input = Silence(1.0);
-  input.insert(input.end(), speech_.begin(), speech_.end());
-  input.insert(input.end(), 10 * kSamplesPerSecond, 0);
-  bool ended = false;
-  Stdout([&] { ended = !Feed(input); });
-  ASSERT_TRUE(ended);
-  ASSERT_EQ(messages_.size(), 1u);
-  EXPECT_EQ(messages_[0],
-            R"({"message":"vad mute timeout","result":{"isBreak":true,"text":""},"status":-100})");
-  EXPECT_EQ(engine_.state(), 1);
-}
-
 }  // namespace
 }  // namespace speech
 }  // namespace vorta

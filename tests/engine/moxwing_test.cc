@@ -200,13 +200,6 @@ TEST_F(MoxwingTest, GlobalInitSetsTheSharedLimitWithAOneSecondFloor) {
   EXPECT_EQ(Moxwing::MaxDuration().count(), 30000);
 }
 
-TEST_F(MoxwingTest, VersionComesFromTheLibrary) {
-  decoder_double::SetVersion("lib 9.9");
-  EXPECT_EQ(Moxwing::Version(), "lib 9.9");
-  decoder_double::SetVersion(nullptr);
-  EXPECT_EQ(Moxwing::Version(), "");
-}
-
 }  // namespace
 }  // namespace speech
 }  // namespace vorta

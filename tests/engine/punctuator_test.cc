@@ -36,19 +36,6 @@ TEST_F(PunctuatorTest, InitFailureIsLogged) {
   EXPECT_EQ(Stdout([&] { EXPECT_FALSE(p.Init()); }), "punctuator init failed\n");
 }
 
-TEST_F(PunctuatorTest, PartialTextsAreLeftAloneUnlessPuncAll) {
-  Punctuator partial_off = Make(false);
-  ASSERT_TRUE(partial_off.Init());
-  EXPECT_EQ(partial_off.Punctuate("hello", false), "");
-  EXPECT_EQ(punctuator_double::Count("punctuator_do_it"), 0);
-  EXPECT_EQ(partial_off.Punctuate("hello", true), "hello.");
-
-  Punctuator partial_on = Make(true);
-  ASSERT_TRUE(partial_on.Init());
-  EXPECT_EQ(partial_on.Punctuate("hello", false), "hello.");
-  EXPECT_EQ(punctuator_double::Calls().back().size_in, 4096);
-}
-
 TEST_F(PunctuatorTest, BufferTooSmallIsRetriedOnceWithTheRequestedSize) {
   Punctuator p = Make(false);
   ASSERT_TRUE(p.Init());

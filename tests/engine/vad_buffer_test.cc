@@ -113,14 +113,6 @@ TEST_F(VadBufferTest, TwoQueuedSegmentsComeOutOneAtATime) {
   EXPECT_FALSE(finished);
 }
 
-TEST_F(VadBufferTest, OutputBeyondTheGivenRoomIsDropped) {
-  quellan_double::QueueOutput(Speech(std::vector<int16_t>(40000, 9), 0, 0));
-  Feed(100);
-  bool finished = false;
-  // The double writes at most the room it is given (100 + 32000 samples).
-  EXPECT_EQ(vad_.TakeSegment(&finished).size(), 32100u);
-}
-
 TEST_F(VadBufferTest, InitAndStartFailures) {
   quellan_double::SetCreateThrowsFor("bad");
   Vad throwing("bad");

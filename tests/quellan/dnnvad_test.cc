@@ -155,19 +155,6 @@ TEST(DetectorTest, GapAcrossCallsNeedsThirtyOneFrames) {
   }
 }
 
-TEST(DetectorTest, SilenceAloneClosesAnOpenSegmentAcrossCalls) {
-  DetectorHarness h(Pattern(200, {{20, 60}}));
-  EXPECT_EQ(h.Feed(75, false).intervals, (Intervals{{5, 60}}));
-  // Batch 70..89: 9 carried + 20 = 29 silent frames, not yet enough.
-  CallResult r = h.Feed(20, false);
-  EXPECT_TRUE(r.intervals.empty());
-  EXPECT_TRUE(r.cuts.empty());
-  // Batch 90..90: the 30th frame closes at 90 + (1 - 29) / 2 = 76.
-  r = h.Feed(1, false);
-  EXPECT_EQ(r.intervals, (Intervals{{61, 76}}));
-  EXPECT_EQ(r.cuts, (std::vector<int>{76}));
-}
-
 TEST(DetectorTest, CallWithoutNewFrameLeavesListsAlone) {
   DetectorHarness h(Pattern(200, {{20, 150}}));
   const CallResult first = h.Feed(40, false);

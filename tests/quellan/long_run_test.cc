@@ -1,9 +1,7 @@
 // Hours-long listening periods must run in fixed memory: twelve minutes
 // between two resets, five times the per-utterance buffers.
 #include <gtest/gtest.h>
-#include <unistd.h>
 
-#include <cstdio>
 #include <string>
 #include <vector>
 
@@ -15,15 +13,6 @@
 namespace {
 
 constexpr int kRate = 16000;
-
-long ResidentKiB() {
-  long pages = 0, resident = 0;
-  FILE* f = std::fopen("/proc/self/statm", "r");
-  if (f == nullptr) return -1;
-  const int got = std::fscanf(f, "%ld %ld", &pages, &resident);
-  std::fclose(f);
-  return got == 2 ? resident * (sysconf(_SC_PAGESIZE) / 1024) : -1;
-}
 
 TEST(LongRunTest, TwelveMinutesWithoutResetStayInFixedMemory) {
   std::vector<int16_t> speech;
@@ -86,10 +75,10 @@ TEST(LongRunTest, MemoryDoesNotGrowWithListeningTime) {
                 0)
           << "second " << second;
     }
-    if (second == 180) after_warm_up = ResidentKiB();
+    if (second == 180) after_warm_up = quellan_test::ResidentKiB();
   }
   EXPECT_EQ(quellan_test::AllocationCount() - allocations_before, 0) << "allocations while processing";
-  const long at_end = ResidentKiB();
+  const long at_end = quellan_test::ResidentKiB();
   ASSERT_GT(after_warm_up, 0);
   EXPECT_LE(at_end - after_warm_up, 256) << "KiB grown after the first three minutes";
 }

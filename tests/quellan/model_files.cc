@@ -2,6 +2,7 @@
 
 #include <sndfile.h>
 #include <stdlib.h>
+#include <unistd.h>
 
 #include <cstdio>
 #include <fstream>
@@ -65,24 +66,6 @@ void WriteMeanTable(const std::string& path, const std::vector<float>& means,
   WriteBytes(path, bytes);
 }
 
-Network SignNetwork(int feat_dim, int start_offset, int end_offset,
-                    int column) {
-  Network net;
-  net.input_length = feat_dim * (1 + start_offset + end_offset);
-  net.output_length = 2;
-  net.hidden = {1};
-  Layer hidden;
-  hidden.bias = {0.0f};
-  hidden.weights.assign(net.input_length, 0.0f);
-  hidden.weights[start_offset * feat_dim + column] = 20.0f;
-  Layer out;
-  // Non-speech logit 0, speech logit 40 h - 20: a saturated +/-20 margin.
-  out.bias = {0.0f, -20.0f};
-  out.weights = {0.0f, 40.0f};
-  net.layers = {hidden, out};
-  return net;
-}
-
 Network ConstantNetwork(int input_length, float score) {
   Network net;
   net.input_length = input_length;
@@ -95,6 +78,15 @@ Network ConstantNetwork(int input_length, float score) {
   out.bias = {0.0f, score};
   out.weights = {0.0f, 0.0f};
   net.layers = {hidden, out};
+  return net;
+}
+
+Network SignNetwork(int feat_dim, int start_offset, int end_offset,
+                    int column) {
+  Network net = ConstantNetwork(feat_dim * (1 + start_offset + end_offset), -20.0f);
+  net.layers[0].weights[start_offset * feat_dim + column] = 20.0f;
+  // Non-speech logit 0, speech logit 40 h - 20: a saturated +/-20 margin.
+  net.layers[1].weights = {0.0f, 40.0f};
   return net;
 }
 
@@ -119,6 +111,15 @@ std::string MakeModelDir(float score) {
 
 std::string CorpusPath(const std::string& relative) {
   return std::string(QUELLAN_TEST_CORPUS_DIR) + "/" + relative;
+}
+
+long ResidentKiB() {
+  long pages = 0, resident = 0;
+  FILE* f = std::fopen("/proc/self/statm", "r");
+  if (f == nullptr) return -1;
+  const int got = std::fscanf(f, "%ld %ld", &pages, &resident);
+  std::fclose(f);
+  return got == 2 ? resident * (sysconf(_SC_PAGESIZE) / 1024) : -1;
 }
 
 bool ReadFlac(const std::string& path, std::vector<int16_t>* samples) {

@@ -48,6 +48,9 @@ std::string MakeModelDir(float score);
 std::string CorpusPath(const std::string& relative);
 bool ReadFlac(const std::string& path, std::vector<int16_t>* samples);
 
+// Resident set size of the process in KiB; -1 when it cannot be read.
+long ResidentKiB();
+
 }  // namespace quellan_test
 
 #endif  // KVASR_TESTS_QUELLAN_MODEL_FILES_H_

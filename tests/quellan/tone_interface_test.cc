@@ -18,12 +18,10 @@ constexpr int kRate = 16000;
 constexpr int kToneDim = 3;
 constexpr float kSentinel = -777.0f;
 
-PitchConf Conf(float scale = 10.0f) {
+PitchConf Conf() {
   PitchConf conf{};
   EXPECT_EQ(load_pitch_conf(nullptr, &conf), 0);
   EXPECT_EQ(conf.tone_dim, kToneDim);
-  EXPECT_EQ(conf.tone_scale, 10.0f);
-  conf.tone_scale = scale;
   return conf;
 }
 
@@ -52,9 +50,8 @@ struct ToneRun {
 };
 
 // Feeds `audio` in chunks of the given sizes (cycled), then ends the stream.
-ToneRun RunTone(const std::vector<int16_t>& audio, const std::vector<int>& chunks,
-                float scale = 10.0f) {
-  auto tone = std::make_unique<Vortaf0Interface>(Conf(scale), 0);
+ToneRun RunTone(const std::vector<int16_t>& audio, const std::vector<int>& chunks) {
+  auto tone = std::make_unique<Vortaf0Interface>(Conf(), 0);
   tone->SetToneFeatureOffset(0);
   ToneRun run;
   const int capacity = static_cast<int>(audio.size()) / 160 + 1;
@@ -101,83 +98,6 @@ TEST(ToneInterfaceFraming, AnyChunkingMatchesWholeFrames) {
     EXPECT_EQ(run.frames, whole.frames) << cut[0];
     EXPECT_EQ(run.features, whole.features) << cut[0];
     EXPECT_EQ(run.raw, whole.raw) << cut[0];
-  }
-}
-
-int Occurrences(const std::string& log, const std::string& line) {
-  int n = 0;
-  for (size_t at = log.find(line); at != std::string::npos; at = log.find(line, at + 1)) ++n;
-  return n;
-}
-
-// A full raw-f0 array fails the call before any analysis; a full output
-// matrix drops each ready frame with a report, and the call succeeds.
-TEST(ToneInterfaceLimits, FullOutputsReportAndDrop) {
-  const std::vector<int16_t> audio = GlideAudio(1);
-  auto tone = std::make_unique<Vortaf0Interface>(Conf(), 0);
-  float raw[4];
-  int written = -5, raw_count = -5;
-  testing::internal::CaptureStdout();
-  EXPECT_EQ(tone->ExtractToneFeature(audio.data(), 800, nullptr, 0, &written, raw, 0,
-                                     &raw_count),
-            -1);
-  const std::string failure = testing::internal::GetCapturedStdout();
-  EXPECT_EQ(failure.rfind("WARNING * [modules/quellan/src/Vortaf0Interface.cc:", 0), 0u)
-      << failure;
-  EXPECT_EQ(Occurrences(failure, "<<ExtractToneFeature>>] Too many frames for raw f0. [0/0].\n"),
-            1);
-  EXPECT_EQ(written, -5);
-  EXPECT_EQ(raw_count, -5);
-
-  tone = std::make_unique<Vortaf0Interface>(Conf(), 0);
-  float cell = kSentinel;
-  testing::internal::CaptureStdout();
-  EXPECT_EQ(tone->ExtractToneFeature(audio.data(), kRate, &cell, 0, &written, nullptr, 0,
-                                     nullptr),
-            0);
-  const std::string log = testing::internal::GetCapturedStdout();
-  EXPECT_EQ(written, 0);
-  EXPECT_EQ(cell, kSentinel);
-  // 100 frames, two of them only fill the buffer, 27 held back.
-  EXPECT_EQ(Occurrences(log, "<<GetToneFeature>>] Two many Frames for tone. [0/0].\n"),
-            100 - 2 - 27);
-}
-
-// Values land at k * stride + offset + d, scaled by 10; the fourth value
-// and the other columns stay untouched.
-TEST(ToneInterfaceLayout, OffsetStrideAndScale) {
-  const std::vector<int16_t> audio = GlideAudio(2);
-  const ToneRun packed = RunTone(audio, {160});
-  auto tone = std::make_unique<Vortaf0Interface>(Conf(), 0);
-  const int base = 5, stride = base + kToneDim;
-  tone->SetToneFeatureOffset(base);
-  EXPECT_EQ(tone->GetToneFeatureDim(), kToneDim);
-  std::vector<float> matrix(static_cast<size_t>(packed.frames + 1) * stride, kSentinel);
-  int written = 0, flushed = 0;
-  ASSERT_EQ(tone->ExtractToneFeature(audio.data(), static_cast<int>(audio.size()),
-                                     matrix.data(), packed.frames + 1, &written,
-                                     nullptr, 0, nullptr),
-            0);
-  ASSERT_EQ(tone->EndToneFeature(matrix.data() + written * stride,
-                                 packed.frames + 1 - written, &flushed),
-            0);
-  EXPECT_EQ(flushed, 27);
-  ASSERT_EQ(written + flushed, packed.frames);
-  for (int k = 0; k <= packed.frames; ++k) {
-    for (int c = 0; c < stride; ++c) {
-      const float got = matrix[static_cast<size_t>(k) * stride + c];
-      if (k == packed.frames || c < base) {
-        EXPECT_EQ(got, kSentinel) << k << "," << c;
-      } else {
-        EXPECT_EQ(got, packed.features[static_cast<size_t>(k) * kToneDim + c - base])
-            << k << "," << c;
-      }
-    }
-  }
-  const ToneRun unscaled = RunTone(audio, {160}, 1.0f);
-  ASSERT_EQ(unscaled.frames, packed.frames);
-  for (size_t i = 0; i < static_cast<size_t>(packed.frames) * kToneDim; ++i) {
-    EXPECT_EQ(packed.features[i], 10.0f * unscaled.features[i]) << i;
   }
 }
 

@@ -3,7 +3,6 @@
 #include <gtest/gtest.h>
 
 #include <cmath>
-#include <limits>
 #include <memory>
 #include <utility>
 #include <vector>
@@ -49,19 +48,6 @@ TEST(ToneStateTest, DelayPendingAndFlushCounts) {
   }
 }
 
-TEST(ToneStateTest, FlushSpacesFramesByOutBase) {
-  auto s = Fresh();
-  s->out_base = 2;
-  PushTrack(s.get(), std::vector<float>(5, 40.0f));
-  std::vector<float> dst(2 + 6 * 5, std::numeric_limits<float>::quiet_NaN());
-  EXPECT_EQ(ToneStateFlush(s.get(), dst.data()), 5);
-  // Frame i at 2 + 6 i; the two floats after each frame stay untouched.
-  for (size_t k = 0; k < dst.size(); ++k) {
-    EXPECT_EQ(std::isnan(dst[k]), k < 2 || (k - 2) % 6 >= 4) << k;
-  }
-  EXPECT_EQ(s->out_base, 2);
-}
-
 TEST(ToneStateTest, StreamStartsAtReferenceWhateverThePitch) {
   for (float pitch : {0.0f, 40.0f, 90.0f}) {
     auto s = Fresh();
@@ -91,81 +77,6 @@ TEST(ToneStateTest, SelectionOfCentreFrame) {
     auto s = Fresh();
     PushTrack(s.get(), pitch);
     EXPECT_EQ(s->smooth3[kToneRepairFrames - 1], c.selected) << c.name;
-  }
-}
-
-TEST(ToneStateTest, OneFrameGapIsRepaired) {
-  constexpr int kGap = 30;
-  std::vector<float> pitch(kGap + 10, 40.0f);
-  pitch[kGap] = 0.0f;
-  auto s = Fresh();
-  // Nine frames after its push the gap is the middle of the repair window.
-  PushTrack(s.get(), pitch);
-  EXPECT_EQ(s->smooth3[1], 0.0f);
-  EXPECT_EQ(s->interp7[kToneInterpFrames - 1], 200.0f);
-}
-
-TEST(ToneStateTest, GapsAreBridgedLinearlyInHz) {
-  std::vector<float> pitch(40, 40.0f);  // 200 Hz
-  pitch.insert(pitch.end(), 3, 0.0f);
-  pitch.insert(pitch.end(), 40, 80.0f);  // 100 Hz
-  pitch.insert(pitch.end(), 40, 0.0f);
-  auto s = Fresh();
-  std::vector<float> hz;  // interpolated frequency of input frame n at n + 14
-  for (float p : pitch) {
-    PushTrack(s.get(), {p});
-    hz.push_back(std::exp(s->norm101[kToneNormFrames - 1]));
-  }
-  const float bridge[] = {200.0f, 175.0f, 150.0f, 125.0f, 100.0f};
-  for (int k = 0; k < 5; ++k) EXPECT_NEAR(hz[39 + 14 + k], bridge[k], 1e-3f);
-  // After the last voiced frame the contour climbs back to the reference.
-  for (size_t i = hz.size() - 30; i < hz.size(); ++i) {
-    EXPECT_GE(hz[i], hz[i - 1] - 1e-3f);
-    EXPECT_LE(hz[i], 185.1f);
-  }
-  EXPECT_NEAR(hz.back(), 185.0f, 0.01f);
-}
-
-TEST(ToneStateTest, OnsetReachesContourTwelveFramesEarly) {
-  // Output frame i belongs to input frame i. The contour looks ahead 2 frames
-  // (averaging), 5 (normalisation) and 5 (gap interpolation), so a voiced
-  // onset at frame T first shows in output frame T - 12; a derivative of
-  // order r 2r frames earlier. Before that all values are exact zeros, which
-  // come out as 1e-8.
-  constexpr int kOnset = 40;
-  std::vector<float> pitch(kOnset, 0.0f);
-  pitch.insert(pitch.end(), 60, 80.0f);
-  auto s = Fresh();
-  std::vector<float> out = PushTrack(s.get(), pitch);
-  std::vector<float> tail(kToneOutFloats);
-  const int flushed = ToneStateFlush(s.get(), tail.data());
-  out.insert(out.end(), tail.begin(),
-             tail.begin() + flushed * kToneValuesPerFrame);
-  ASSERT_EQ(out.size(), pitch.size() * kToneValuesPerFrame);
-  for (int i = 0; i < kOnset - 12; ++i) {
-    for (int r = 0; r < kToneValuesPerFrame && i < kOnset - 12 - 2 * r; ++r) {
-      EXPECT_EQ(out[i * kToneValuesPerFrame + r], 1e-8f) << i << " " << r;
-    }
-  }
-  EXPECT_GT(out[(kOnset - 12) * kToneValuesPerFrame], 1e-6f);
-}
-
-TEST(ToneStateTest, DerivativesFollowFromNeighbouringFrames) {
-  std::vector<float> pitch;
-  for (int i = 0; i < 200; ++i)
-    pitch.push_back(30.0f + 10.0f * std::sin(i / 7.0f));
-  auto s = Fresh();
-  const std::vector<float> out = PushTrack(s.get(), pitch);
-  const int frames = static_cast<int>(out.size()) / kToneValuesPerFrame;
-  ASSERT_GT(frames, 100);
-  auto at = [&](int t, int r) { return out[t * kToneValuesPerFrame + r]; };
-  for (int r = 1; r < kToneValuesPerFrame; ++r) {
-    for (int t = 2; t + 2 < frames; ++t) {
-      const float expected = (2 * (at(t + 2, r - 1) - at(t - 2, r - 1)) +
-                              (at(t + 1, r - 1) - at(t - 1, r - 1))) /
-                             10.0f;
-      ASSERT_NEAR(at(t, r), expected, 1e-6f) << "order " << r << " frame " << t;
-    }
   }
 }
 

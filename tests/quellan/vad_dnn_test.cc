@@ -48,52 +48,37 @@ TEST_F(VadDnnFileTest, RefusesBrokenNetworkFiles) {
 
   ExpectRefused(Path("missing"), "Failed to open file:" + Path("missing"));
 
-  quellan_test::WriteBytes(path, std::string("MYDNN2\0\0", 8) + Bytes({1, 2, 0}));
-  ExpectRefused(path, "Failed to load DNN_FLAG from file[" + path +
-                          "], flag[MYDNN2]\n\n");
-  quellan_test::WriteBytes(path, "MYDNN");
-  ExpectRefused(path, "Failed to load DNN_FLAG");
-
-  quellan_test::WriteBytes(path, flag);
-  ExpectRefused(path, "Failed to load input_length from file[" + path + "]");
-  quellan_test::WriteBytes(path, flag + Bytes({4}));
-  ExpectRefused(path, "Failed to load output_length from file[" + path + "]");
-  quellan_test::WriteBytes(path, flag + Bytes({4, 2}));
-  ExpectRefused(path, "Failed to load layers_num from file[" + path + "]");
-  quellan_test::WriteBytes(path, flag + Bytes({4, 2, 17}) +
-                                     Bytes(std::vector<int32_t>(17, 3)));
-  ExpectRefused(path, "Failed to load layers_num from file[" + path + "]");
-  quellan_test::WriteBytes(path, flag + Bytes({4, 2, 2, 3}));
-  ExpectRefused(path, "Failed to load hidden_node_array from file[" + path + "]");
-
   // Layer 0 of a 4-3-2 network: 3 biases, then 12 weights.
   const std::string head = flag + Bytes({4, 2, 1, 3});
-  quellan_test::WriteBytes(path, head + std::string(8, '\0'));
-  ExpectRefused(path, "Failed to load layers[0].bias in load_all_dnn_layers");
-  quellan_test::WriteBytes(path, head + std::string(4 * (3 + 11), '\0'));
-  ExpectRefused(path, "Failed to load layers[0].weights in load_all_dnn_layers");
-  quellan_test::WriteBytes(path, head + std::string(4 * (3 + 12 + 2 + 5), '\0'));
-  ExpectRefused(path, "Failed to load layers[1].weights in load_all_dnn_layers");
+  const struct {
+    std::string bytes;
+    std::string message;
+  } cases[] = {
+      {std::string("MYDNN2\0\0", 8) + Bytes({1, 2, 0}),
+       "Failed to load DNN_FLAG from file[" + path + "], flag[MYDNN2]\n\n"},
+      {"MYDNN", "Failed to load DNN_FLAG"},
+      {flag, "Failed to load input_length from file[" + path + "]"},
+      {flag + Bytes({4}), "Failed to load output_length from file[" + path + "]"},
+      {flag + Bytes({4, 2}), "Failed to load layers_num from file[" + path + "]"},
+      {flag + Bytes({4, 2, 17}) + Bytes(std::vector<int32_t>(17, 3)),
+       "Failed to load layers_num from file[" + path + "]"},
+      {flag + Bytes({4, 2, 2, 3}), "Failed to load hidden_node_array from file[" + path + "]"},
+      {head + std::string(8, '\0'), "Failed to load layers[0].bias in load_all_dnn_layers"},
+      {head + std::string(4 * (3 + 11), '\0'),
+       "Failed to load layers[0].weights in load_all_dnn_layers"},
+      {head + std::string(4 * (3 + 12 + 2 + 5), '\0'),
+       "Failed to load layers[1].weights in load_all_dnn_layers"},
+  };
+  for (const auto& c : cases) {
+    quellan_test::WriteBytes(path, c.bytes);
+    ExpectRefused(path, c.message);
+  }
   testing::internal::CaptureStdout();
   quellan_test::WriteBytes(path, head + std::string(4 * (3 + 12 + 2 + 6), '\0'));
   VadDnn* dnn = load_vaddnn_file(path.c_str());
   testing::internal::GetCapturedStdout();
   ASSERT_NE(dnn, nullptr);
   EXPECT_EQ(dnn->layers_num, 2);
-  free_vaddnn(dnn);
-}
-
-TEST_F(VadDnnFileTest, AcceptsAnyEighthFlagByteAndNoHiddenLayer) {
-  Network net = quellan_test::ConstantNetwork(11, 0.0f);
-  net.hidden.clear();
-  net.layers.erase(net.layers.begin());
-  net.layers[0].weights.assign(11 * 2, 0.0f);
-  quellan_test::WriteNetwork(Path("net"), net, std::string("MYDNN1\0\xA5", 8));
-  VadDnn* dnn = load_vaddnn_file(Path("net").c_str());
-  ASSERT_NE(dnn, nullptr);
-  EXPECT_EQ(dnn->layers_num, 1);
-  EXPECT_EQ(dnn->layers[0].input_dim, 11);
-  EXPECT_EQ(dnn->layers[0].output_dim, 2);
   free_vaddnn(dnn);
 }
 
@@ -162,7 +147,6 @@ TEST_F(VadDnnScoreTest, ScoreIsLogPosteriorRatio) {
   ASSERT_EQ(calc_vaddnn_prob(dnn, rows, score), 3);
   const double expected = std::log(0.75 + 1e-7) - std::log(0.25 + 1e-7);
   for (float s : score) EXPECT_NEAR(s, expected, 1e-5);
-  EXPECT_NEAR(expected, 1.0986, 1e-4);
   free_vaddnn(dnn);
 }
 

@@ -1,9 +1,6 @@
 #include "listening.h"
 
-#include <unistd.h>
-
 #include <algorithm>
-#include <cstdio>
 #include <stdexcept>
 
 #include <cpprest/json.h>
@@ -57,16 +54,6 @@ Transcript Listen(const std::string& model_dir, const std::string& start_params,
   engine.Stop();
   engine.Close();
   return t;
-}
-
-long ResidentKiB() {
-  long pages = 0;
-  long resident = 0;
-  FILE* f = std::fopen("/proc/self/statm", "r");
-  if (f == nullptr) return -1;
-  const int got = std::fscanf(f, "%ld %ld", &pages, &resident);
-  std::fclose(f);
-  return got == 2 ? resident * (sysconf(_SC_PAGESIZE) / 1024) : -1;
 }
 
 }  // namespace kvasr_reliability

@@ -34,8 +34,6 @@ struct Transcript {
 Transcript Listen(const std::string& model_dir, const std::string& start_params,
                   const std::vector<int16_t>& audio, int chunk);
 
-// Resident set size of the process in KiB.
-long ResidentKiB();
 
 }  // namespace kvasr_reliability
 

@@ -85,9 +85,9 @@ TEST(LongListeningTest, HoursOfSpeechAndPausesInOnePeriod) {
     for (size_t i = before; i < segments.size(); ++i) samples += segments[i].samples;
     segments_per_cycle.push_back(segments.size() - before);
     samples_per_cycle.push_back(samples);
-    if (c == 0) rss_start = ResidentKiB();
+    if (c == 0) rss_start = quellan_test::ResidentKiB();
   }
-  const long rss_end = ResidentKiB();
+  const long rss_end = quellan_test::ResidentKiB();
 
   // The pauses before the limit never end the period; one longer does.
   const std::vector<int16_t> silence(kChunk, 0);

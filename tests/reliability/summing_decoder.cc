@@ -46,11 +46,6 @@ bool ParseText(const std::string& text, Segment* segment) {
   return true;
 }
 
-uint64_t Hash(const std::vector<int16_t>& samples) {
-  uint64_t hash = kFnvOffset;
-  for (int16_t s : samples) hash = Mix(hash, s);
-  return hash;
-}
 
 }  // namespace summing_decoder
 

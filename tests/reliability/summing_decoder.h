@@ -6,7 +6,6 @@
 
 #include <cstdint>
 #include <string>
-#include <vector>
 
 namespace summing_decoder {
 
@@ -19,8 +18,6 @@ struct Segment {
 // Parses the text of a final result this decoder produced; false otherwise.
 bool ParseText(const std::string& text, Segment* segment);
 
-// The hash the decoder reports for `samples` decoded in one stretch.
-uint64_t Hash(const std::vector<int16_t>& samples);
 
 }  // namespace summing_decoder
 

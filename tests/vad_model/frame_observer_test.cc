@@ -116,30 +116,4 @@ TEST(FrameObserver, WatchingChangesNoOutputAndUnsettingStopsReports) {
   EXPECT_EQ(recorder.frames.size(), reported);
 }
 
-TEST(FrameObserver, ClosingIntervalIsTheOneFlaggedEnded) {
-  const Model model;
-  Cquellan pipe(quellan_test::PipelineConf(model.dir, false));
-  const std::vector<int16_t> audio = Bursts(8.0);
-  std::vector<int16_t> out(64000);
-  int closes = 0;
-  int index = 0;
-  for (size_t pos = 0; pos < audio.size(); pos += 1600) {
-    const int len = static_cast<int>(std::min<size_t>(1600, audio.size() - pos));
-    ++index;
-    const bool last = pos + len == audio.size();
-    int out_len = 0, speech = 0, continued = 0, ended = 0;
-    ASSERT_EQ(pipe.quellan_process(last ? -index : index, audio.data() + pos, len,
-                                   out.data(), static_cast<int>(out.size()),
-                                   &out_len, &speech, &continued, &ended),
-              0);
-    const int n = pipe.emitted_count();
-    if (n == 0) continue;
-    EXPECT_EQ(pipe.emitted(n - 1).closes, ended == 1) << "call " << index;
-    for (int i = 0; i < n; ++i) closes += pipe.emitted(i).closes ? 1 : 0;
-  }
-  // Four bursts end in silence long enough to close their segments (a call
-  // that adds no frame repeats its intervals, so count at least four).
-  EXPECT_GE(closes, 4);
-}
-
 }  // namespace
