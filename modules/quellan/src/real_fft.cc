@@ -4,6 +4,8 @@
 
 #include <cmath>
 
+#include "cpu_features.h"
+
 RealFft::RealFft(int fft_n)
     : fft_n_(fft_n),
       re_(fft_n),
@@ -79,12 +81,12 @@ typedef double Lanes
                    may_alias));
 
 // One stage's butterflies on a group of 2 * half values, half a multiple
-// of four. Cloned for AVX, picked at load time where the processor has it:
-// the lanes do the same multiplications, additions and subtractions as
-// scalar butterflies, so both builds give the same results.
-__attribute__((target_clones("avx", "default")))
-void butterflies(double* re_a, double* im_a, int half, const double* tw_re,
-                 const double* tw_im) {
+// of four. Built twice, for AVX and for the baseline: the lanes do the same
+// multiplications, additions and subtractions as scalar butterflies, so
+// both builds give the same results.
+__attribute__((always_inline)) inline void butterflies(
+    double* re_a, double* im_a, int half, const double* tw_re,
+    const double* tw_im) {
   double* re_b = re_a + half;
   double* im_b = im_a + half;
   for (int k = 0; k < half; k += 4) {
@@ -103,6 +105,27 @@ void butterflies(double* re_a, double* im_a, int half, const double* tw_re,
   }
 }
 
+// All stages after the first two, over n values.
+__attribute__((always_inline)) inline void later_stages(
+    int n, double* re, double* im, const double* tw_re, const double* tw_im) {
+  for (int len = 8; len <= n; len <<= 1) {
+    const int half = len / 2;
+    for (int start = 0; start < n; start += len) {
+      butterflies(re + start, im + start, half, tw_re + half, tw_im + half);
+    }
+  }
+}
+
+__attribute__((target("avx"))) void later_stages_avx(
+    int n, double* re, double* im, const double* tw_re, const double* tw_im) {
+  later_stages(n, re, im, tw_re, tw_im);
+}
+
+void later_stages_baseline(int n, double* re, double* im, const double* tw_re,
+                           const double* tw_im) {
+  later_stages(n, re, im, tw_re, tw_im);
+}
+
 }  // namespace
 
 void RealFft::magnitude(const float* frame, float* magnitude) {
@@ -112,13 +135,8 @@ void RealFft::magnitude(const float* frame, float* magnitude) {
   first_stages(frame);
   double* re = re_.data();
   double* im = im_.data();
-  for (int len = 8; len <= fft_n_; len <<= 1) {
-    const int half = len / 2;
-    for (int start = 0; start < fft_n_; start += len) {
-      butterflies(re + start, im + start, half, twiddle_re_.data() + half,
-                  twiddle_im_.data() + half);
-    }
-  }
+  (cpu_has_avx() ? later_stages_avx : later_stages_baseline)(
+      fft_n_, re, im, twiddle_re_.data(), twiddle_im_.data());
   const int bins = fft_n_ / 2 + 1;
   int k = 0;
   // Four bins at a time: the conversions, products, sum and square root

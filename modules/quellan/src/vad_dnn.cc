@@ -7,6 +7,7 @@
 #include <cstdlib>
 #include <cstring>
 
+#include "cpu_features.h"
 #include "quellan_log.h"
 
 namespace {
@@ -56,11 +57,11 @@ void release_layers(VadDnn* dnn) {
 constexpr int kOutputBlock = 64;
 
 // out[r][j] = alpha * sum_k w[k][j] * in[r][k] + beta * out[r][j]
-// Cloned for AVX, picked at load time where the processor has it: wider
-// lanes, the same sums in the same order.
-__attribute__((target_clones("avx", "default")))
-void layer_product(const float* in, int rows, int in_dim, const float* weights,
-                   int out_dim, float alpha, float beta, float* out) {
+// Built twice, for AVX and for the baseline: wider lanes, the same sums in
+// the same order.
+__attribute__((always_inline)) inline void layer_product_body(
+    const float* in, int rows, int in_dim, const float* weights, int out_dim,
+    float alpha, float beta, float* out) {
   for (int r = 0; r < rows; ++r) {
     const float* in_row = in + static_cast<size_t>(r) * in_dim;
     float* out_row = out + static_cast<size_t>(r) * out_dim;
@@ -85,6 +86,24 @@ void layer_product(const float* in, int rows, int in_dim, const float* weights,
       }
     }
   }
+}
+
+__attribute__((target("avx"))) void layer_product_avx(
+    const float* in, int rows, int in_dim, const float* weights, int out_dim,
+    float alpha, float beta, float* out) {
+  layer_product_body(in, rows, in_dim, weights, out_dim, alpha, beta, out);
+}
+
+void layer_product_baseline(const float* in, int rows, int in_dim,
+                            const float* weights, int out_dim, float alpha,
+                            float beta, float* out) {
+  layer_product_body(in, rows, in_dim, weights, out_dim, alpha, beta, out);
+}
+
+void layer_product(const float* in, int rows, int in_dim, const float* weights,
+                   int out_dim, float alpha, float beta, float* out) {
+  (cpu_has_avx() ? layer_product_avx : layer_product_baseline)(
+      in, rows, in_dim, weights, out_dim, alpha, beta, out);
 }
 
 void fill_bias(const VadDnnLayer& layer, int rows) {
