@@ -4,6 +4,8 @@
 #include <cstdlib>
 #include <cstring>
 
+#include "real_fft.h"
+
 namespace {
 
 constexpr int kInitialFill = 20;  // every stream starts 2.5 ms late
@@ -23,33 +25,9 @@ constexpr float kMelDivisor = 2595.0f;
 // The mel scale's 700 Hz corner in bins of the 8 kHz spectrum.
 constexpr double kMelCornerBins = 700.0 * kFftSize / 8000.0;
 
-constexpr int kFftStages = 8;  // log2(kFftSize)
-
-// cos and sin of 2 pi m / 256 and the bit-reversed order; built once, so
-// that the tracker block stays plain.
-struct FftTables {
-  double cos[kFftSize / 2];
-  double sin[kFftSize / 2];
-  int bit_reverse[kFftSize];
-  FftTables() {
-    for (int m = 0; m < kFftSize / 2; ++m) {
-      const double angle = 2.0 * M_PI * m / kFftSize;
-      cos[m] = std::cos(angle);
-      sin[m] = std::sin(angle);
-    }
-    for (int n = 0; n < kFftSize; ++n) {
-      int r = 0;
-      for (int b = 0; b < kFftStages; ++b) {
-        r |= ((n >> b) & 1) << (kFftStages - 1 - b);
-      }
-      bit_reverse[n] = r;
-    }
-  }
-};
-
-const FftTables& fft_tables() {
-  static const FftTables tables;
-  return tables;
+const RealFft& transform_fft() {
+  static const RealFft fft(kFftSize);
+  return fft;
 }
 
 // 256-point DFT of the windowed 200 samples (the other 56 are zero) by an
@@ -57,29 +35,13 @@ const FftTables& fft_tables() {
 // X[k] = sum x[n] exp(-2 pi i k n / 256).
 void Transform(const float* analysis, const float* window,
                float transform[kTransformFloats]) {
-  const FftTables& tables = fft_tables();
-  double re[kFftSize] = {};
-  double im[kFftSize] = {};
+  double x[kFftSize] = {};
   for (int n = 0; n < kAnalysisSamples; ++n) {
-    re[tables.bit_reverse[n]] = static_cast<double>(analysis[n]) * window[n];
+    x[n] = static_cast<double>(analysis[n]) * window[n];
   }
-  for (int half = 1; half < kFftSize; half *= 2) {
-    const int step = kFftSize / (2 * half);  // twiddle stride for this stage
-    for (int start = 0; start < kFftSize; start += 2 * half) {
-      for (int j = 0; j < half; ++j) {
-        const double wr = tables.cos[j * step];
-        const double wi = -tables.sin[j * step];
-        const int a = start + j;
-        const int b = a + half;
-        const double tr = wr * re[b] - wi * im[b];
-        const double ti = wr * im[b] + wi * re[b];
-        re[b] = re[a] - tr;
-        im[b] = im[a] - ti;
-        re[a] += tr;
-        im[a] += ti;
-      }
-    }
-  }
+  double re[kFftSize];
+  double im[kFftSize];
+  transform_fft().transform(x, re, im);
   for (int k = 1; k < kLastBin; ++k) {
     transform[2 * (k - 1)] = static_cast<float>(re[k]);
     transform[2 * (k - 1) + 1] = static_cast<float>(im[k]);

@@ -32,9 +32,8 @@ RealFft::RealFft(int fft_n)
   }
 }
 
-void RealFft::first_stages(const float* frame) {
-  double* re = re_.data();
-  double* im = im_.data();
+template <typename Sample>
+void RealFft::first_stages(const Sample* frame, double* re, double* im) const {
   if (fft_n_ == 2) {
     re[0] = static_cast<double>(frame[0]) + frame[1];
     re[1] = static_cast<double>(frame[0]) - frame[1];
@@ -106,7 +105,7 @@ __attribute__((always_inline)) inline void butterflies(
 }
 
 // All stages after the first two, over n values.
-__attribute__((always_inline)) inline void later_stages(
+__attribute__((always_inline)) inline void butterfly_stages(
     int n, double* re, double* im, const double* tw_re, const double* tw_im) {
   for (int len = 8; len <= n; len <<= 1) {
     const int half = len / 2;
@@ -118,25 +117,34 @@ __attribute__((always_inline)) inline void later_stages(
 
 __attribute__((target("avx"))) void later_stages_avx(
     int n, double* re, double* im, const double* tw_re, const double* tw_im) {
-  later_stages(n, re, im, tw_re, tw_im);
+  butterfly_stages(n, re, im, tw_re, tw_im);
 }
 
 void later_stages_baseline(int n, double* re, double* im, const double* tw_re,
                            const double* tw_im) {
-  later_stages(n, re, im, tw_re, tw_im);
+  butterfly_stages(n, re, im, tw_re, tw_im);
 }
 
 }  // namespace
 
-void RealFft::magnitude(const float* frame, float* magnitude) {
-  // The trimmed arithmetic only drops additions of zero and products with
-  // zero or one, which leave every non-zero value as the full butterflies
-  // compute it; a zero's sign cannot reach a magnitude.
-  first_stages(frame);
-  double* re = re_.data();
-  double* im = im_.data();
+void RealFft::later_stages(double* re, double* im) const {
   (cpu_has_avx() ? later_stages_avx : later_stages_baseline)(
       fft_n_, re, im, twiddle_re_.data(), twiddle_im_.data());
+}
+
+// The trimmed arithmetic of the first stages only drops additions of zero
+// and products with zero or one, which leave every non-zero value as the
+// full butterflies compute it; only the sign of a zero can differ.
+void RealFft::transform(const double* frame, double* re, double* im) const {
+  first_stages(frame, re, im);
+  later_stages(re, im);
+}
+
+void RealFft::magnitude(const float* frame, float* magnitude) {
+  double* re = re_.data();
+  double* im = im_.data();
+  first_stages(frame, re, im);
+  later_stages(re, im);
   const int bins = fft_n_ / 2 + 1;
   int k = 0;
   // Four bins at a time: the conversions, products, sum and square root
