@@ -65,37 +65,107 @@ class HalfReader {
   const unsigned char* p_;
 };
 
-// Transposes [rows][cols] to [cols][rows].
-std::vector<float> Transpose(const std::vector<float>& m, size_t rows, size_t cols) {
-  std::vector<float> t(m.size());
+// Lanes of floats: eight for the AVX2 build (one register), four for the
+// baseline (one SSE register).
+typedef float Lanes8 __attribute__((vector_size(8 * sizeof(float))));
+typedef float Lanes4 __attribute__((vector_size(4 * sizeof(float))));
+
+// Rows computed together: each weight vector loaded serves all of them.
+constexpr int kTimeBlock = 4;
+// Outputs per tile, chosen so a tile's sums fill about half the vector
+// registers (4 rows x 2 AVX registers; 4 x 2 SSE); the recurrent product has
+// a single row and takes wider tiles to keep enough sums in flight.
+constexpr size_t kRowsOutBlock = 16;
+constexpr size_t kRowsOutBlockBaseline = 8;
+constexpr size_t kStateOutBlock = 64;
+constexpr size_t kStateOutBlockBaseline = 32;
+
+// out[r][o] = bias[o] + sum over parts p and inputs i of
+// in[r * parts + p][i] * w[(p * cin + i) * stride + o], for o < cout. A part
+// is a convolution tap (one part for a plain matrix product). Weights and
+// bias are padded with zeros to `stride`, a multiple of kOut, so every tile
+// is whole.
+template <typename V, int kRows, size_t kOut>
+__attribute__((always_inline)) inline void ProductTiles(const float* const* in, int parts, size_t cin,
+                                                        const float* w, size_t stride, const float* bias,
+                                                        size_t cout, float* const* out) {
+  constexpr size_t kLanes = sizeof(V) / sizeof(float);
+  constexpr size_t kVectors = kOut / kLanes;
+  for (size_t o0 = 0; o0 < cout; o0 += kOut) {
+    // Fully unrolled so the sums live in registers, not on the stack;
+    // memcpy is the unaligned load (weights and biases are float-aligned).
+    V acc[kRows][kVectors];
+#pragma GCC unroll 8
+    for (int r = 0; r < kRows; ++r)
+#pragma GCC unroll 8
+      for (size_t v = 0; v < kVectors; ++v) std::memcpy(&acc[r][v], bias + o0 + v * kLanes, sizeof(V));
+    for (int p = 0; p < parts; ++p) {
+      const float* wp = w + static_cast<size_t>(p) * cin * stride + o0;
+      for (size_t i = 0; i < cin; ++i) {
+        const float* wi = wp + i * stride;
+#pragma GCC unroll 8
+        for (int r = 0; r < kRows; ++r) {
+          const float a = in[r * parts + p][i];
+#pragma GCC unroll 8
+          for (size_t v = 0; v < kVectors; ++v) {
+            V wv;
+            std::memcpy(&wv, wi + v * kLanes, sizeof wv);
+            acc[r][v] += a * wv;
+          }
+        }
+      }
+    }
+    const size_t width = std::min(kOut, cout - o0);
+    for (int r = 0; r < kRows; ++r) std::copy_n(reinterpret_cast<const float*>(acc[r]), width, out[r] + o0);
+  }
+}
+
+// Chosen once, at first use: resolvers run by the loader (ifunc) come before
+// sanitizer runtimes are ready, and "arch=" clones dispatch on the CPU model
+// rather than its features.
+bool HasAvx2Fma() {
+  static const bool has = __builtin_cpu_supports("avx2") && __builtin_cpu_supports("fma");
+  return has;
+}
+
+__attribute__((target("avx2,fma"))) void RowsProductAvx2(const float* const* in, int parts, size_t cin,
+                                                         const float* w, size_t stride, const float* bias,
+                                                         size_t cout, float* const* out) {
+  ProductTiles<Lanes8, kTimeBlock, kRowsOutBlock>(in, parts, cin, w, stride, bias, cout, out);
+}
+
+__attribute__((target("avx2,fma"))) void StateProductAvx2(const float* in, size_t cin, const float* w,
+                                                          size_t stride, const float* bias, size_t cout,
+                                                          float* out) {
+  ProductTiles<Lanes8, 1, kStateOutBlock>(&in, 1, cin, w, stride, bias, cout, &out);
+}
+
+void RowsProduct(const float* const* in, int parts, size_t cin, const float* w, size_t stride,
+                 const float* bias, size_t cout, float* const* out) {
+  if (HasAvx2Fma()) return RowsProductAvx2(in, parts, cin, w, stride, bias, cout, out);
+  ProductTiles<Lanes4, kTimeBlock, kRowsOutBlockBaseline>(in, parts, cin, w, stride, bias, cout, out);
+}
+
+// The product of the recurrent state (one row) with a gate matrix.
+void StateProduct(const float* in, size_t cin, const float* w, size_t stride, const float* bias, size_t cout,
+                  float* out) {
+  if (HasAvx2Fma()) return StateProductAvx2(in, cin, w, stride, bias, cout, out);
+  ProductTiles<Lanes4, 1, kStateOutBlockBaseline>(&in, 1, cin, w, stride, bias, cout, &out);
+}
+
+size_t RoundUp(size_t n, size_t block) { return (n + block - 1) / block * block; }
+
+// [rows][cols] to [cols][stride], the columns past `rows` zero.
+std::vector<float> TransposePadded(const std::vector<float>& m, size_t rows, size_t cols, size_t stride) {
+  std::vector<float> t(cols * stride, 0.0f);
   for (size_t r = 0; r < rows; ++r)
-    for (size_t c = 0; c < cols; ++c) t[c * rows + r] = m[r * cols + c];
+    for (size_t c = 0; c < cols; ++c) t[c * stride + r] = m[r * cols + c];
   return t;
 }
 
-// y += a * x over n floats: the inner loop of every layer, built twice so
-// machines with AVX2 and FMA get the wider version.
-__attribute__((target_clones("arch=haswell", "default"))) void Axpy(float a, const float* x,
-                                                                      float* y, size_t n) {
-  for (size_t i = 0; i < n; ++i) y[i] += a * x[i];
-}
-
-// Four rows at once: each weight row is loaded once for four time steps.
-constexpr int kTimeBlock = 4;
-__attribute__((target_clones("arch=haswell", "default"))) void Axpy4(const float* a, const float* __restrict__ x,
-                                                                       float* const* y, size_t n) {
-  float* __restrict__ y0 = y[0];
-  float* __restrict__ y1 = y[1];
-  float* __restrict__ y2 = y[2];
-  float* __restrict__ y3 = y[3];
-  const float a0 = a[0], a1 = a[1], a2 = a[2], a3 = a[3];
-  for (size_t i = 0; i < n; ++i) {
-    const float w = x[i];
-    y0[i] += a0 * w;
-    y1[i] += a1 * w;
-    y2[i] += a2 * w;
-    y3[i] += a3 * w;
-  }
+std::vector<float> Padded(std::vector<float> v, size_t size) {
+  v.resize(size, 0.0f);
+  return v;
 }
 
 float Sigmoid(float x) { return 1.0f / (1.0f + std::exp(-x)); }
@@ -163,28 +233,32 @@ bool Network::Load(const std::string& path, std::string* error) {
 
   // The size check above guarantees every Take stays inside the file.
   HalfReader r(bytes.data() + kHeaderBytes);
+  conv_stride_ = RoundUp(s.channels, kRowsOutBlock);
+  input_gate_stride_ = RoundUp(3 * size_t{s.hidden}, kRowsOutBlock);
+  state_gate_stride_ = RoundUp(3 * size_t{s.hidden}, kStateOutBlock);
   word_emb_ = r.Take(size_t{s.vocab} * s.dim);
   piece_emb_ = r.Take(size_t{s.pieces} * s.dim);
   conv_w_.assign(s.convs, {});
   conv_b_.assign(s.convs, {});
   for (uint32_t l = 0; l < s.convs; ++l) {
     const size_t cin = l ? s.channels : conv_in0;
-    // Stored [out][in][tap]; reordered to [tap][in][out].
+    // Stored [out][in][tap]; reordered to [tap][in][out], outputs padded.
     const std::vector<float> w = r.Take(size_t{s.channels} * cin * s.kernel);
     std::vector<float>& dst = conv_w_[l];
-    dst.resize(w.size());
+    dst.assign(s.kernel * cin * conv_stride_, 0.0f);
     for (size_t o = 0; o < s.channels; ++o)
       for (size_t i = 0; i < cin; ++i)
         for (size_t k = 0; k < s.kernel; ++k)
-          dst[(k * cin + i) * s.channels + o] = w[(o * cin + i) * s.kernel + k];
-    conv_b_[l] = r.Take(s.channels);
+          dst[(k * cin + i) * conv_stride_ + o] = w[(o * cin + i) * s.kernel + k];
+    conv_b_[l] = Padded(r.Take(s.channels), conv_stride_);
   }
   if (s.hidden) {
+    const size_t gates = 3 * size_t{s.hidden};
     for (Gru* g : {&forward_, &backward_}) {
-      g->w_ih = Transpose(r.Take(3 * size_t{s.hidden} * width), 3 * size_t{s.hidden}, width);
-      g->w_hh = Transpose(r.Take(3 * size_t{s.hidden} * s.hidden), 3 * size_t{s.hidden}, s.hidden);
-      g->b_ih = r.Take(3 * size_t{s.hidden});
-      g->b_hh = r.Take(3 * size_t{s.hidden});
+      g->w_ih = TransposePadded(r.Take(gates * width), gates, width, input_gate_stride_);
+      g->w_hh = TransposePadded(r.Take(gates * s.hidden), gates, s.hidden, state_gate_stride_);
+      g->b_ih = Padded(r.Take(gates), input_gate_stride_);
+      g->b_hh = Padded(r.Take(gates), state_gate_stride_);
     }
   }
   punct_w_ = r.Take(size_t{s.punct_classes} * feat);
@@ -195,10 +269,11 @@ bool Network::Load(const std::string& path, std::string* error) {
   const size_t window = static_cast<size_t>(max_window());
   const size_t act = std::max<size_t>(s.dim, s.channels);
   act_a_.assign(window * act, 0.0f);
-  // Spare rows for the last time block of the convolutions.
+  // Spare rows take the outputs of the last time block past the text.
   act_b_.assign((window + kTimeBlock) * act, 0.0f);
+  zeros_.assign(act, 0.0f);
   feat_.assign(window * feat, 0.0f);
-  gates_x_.assign(window * 3 * s.hidden, 0.0f);
+  gates_x_.assign((window + kTimeBlock) * 3 * s.hidden, 0.0f);
   gates_h_.assign(3 * s.hidden, 0.0f);
   state_.assign(s.hidden, 0.0f);
   return true;
@@ -230,38 +305,21 @@ void Network::Embed(const WordInput* words, int n) {
 void Network::Convolve(int layer, int n) {
   const size_t cin = layer ? shape_.channels : shape_.dim;
   const size_t cout = shape_.channels;
-  const int half = static_cast<int>(shape_.kernel / 2);
+  const int kernel = static_cast<int>(shape_.kernel);
+  const int half = kernel / 2;
   const int dilation = 1 << layer;
-  const std::vector<float>& w = conv_w_[layer];
-  // Input in act_a_, output in act_b_; zero padding at both ends. Rows past
-  // the text in the last block write to spare rows of act_b_.
+  // Input in act_a_, output in act_b_; taps outside the text read zeros.
+  const float* in[kTimeBlock * kMaxKernel];
+  float* out[kTimeBlock];
   for (int t0 = 0; t0 < n; t0 += kTimeBlock) {
-    float* y[kTimeBlock];
     for (int j = 0; j < kTimeBlock; ++j) {
-      y[j] = &act_b_[static_cast<size_t>(t0 + j) * cout];
-      std::copy_n(conv_b_[layer].data(), cout, y[j]);
-    }
-    for (int k = 0; k < static_cast<int>(shape_.kernel); ++k) {
-      const float* x[kTimeBlock];
-      bool any = false;
-      for (int j = 0; j < kTimeBlock; ++j) {
+      out[j] = &act_b_[static_cast<size_t>(t0 + j) * cout];
+      for (int k = 0; k < kernel; ++k) {
         const int src = t0 + j + (k - half) * dilation;
-        const bool inside = t0 + j < n && src >= 0 && src < n;
-        x[j] = inside ? &act_a_[static_cast<size_t>(src) * cin] : nullptr;
-        any = any || inside;
-      }
-      if (!any) continue;
-      const float* wk = &w[k * cin * cout];
-      for (size_t i = 0; i < cin; ++i) {
-        float a[kTimeBlock];
-        bool nonzero = false;
-        for (int j = 0; j < kTimeBlock; ++j) {
-          a[j] = x[j] ? x[j][i] : 0.0f;
-          nonzero = nonzero || a[j] != 0.0f;
-        }
-        if (nonzero) Axpy4(a, wk + i * cout, y, cout);
+        in[j * kernel + k] = t0 + j < n && src >= 0 && src < n ? &act_a_[static_cast<size_t>(src) * cin] : zeros_.data();
       }
     }
+    RowsProduct(in, kernel, cin, conv_w_[layer].data(), conv_stride_, conv_b_[layer].data(), cout, out);
   }
   // The first layer changes width; the others add to what they are given.
   for (int t = 0; t < n; ++t) {
@@ -276,30 +334,31 @@ void Network::Convolve(int layer, int n) {
 
 void Network::RunGru(const Gru& g, int n, bool reverse, int out_offset) {
   const size_t hid = shape_.hidden;
+  const size_t gates = 3 * hid;
   const size_t width = shape_.convs ? shape_.channels : shape_.dim;
   const size_t feat = 2 * hid;
-  for (int t = 0; t < n; ++t) {
-    float* gx = &gates_x_[t * 3 * hid];
-    std::copy_n(g.b_ih.data(), 3 * hid, gx);
-    const float* x = &act_a_[t * width];
-    for (size_t i = 0; i < width; ++i) {
-      if (x[i] != 0.0f) Axpy(x[i], &g.w_ih[i * 3 * hid], gx, 3 * hid);
+  const float* in[kTimeBlock];
+  float* out[kTimeBlock];
+  for (int t0 = 0; t0 < n; t0 += kTimeBlock) {
+    for (int j = 0; j < kTimeBlock; ++j) {
+      in[j] = t0 + j < n ? &act_a_[static_cast<size_t>(t0 + j) * width] : zeros_.data();
+      out[j] = &gates_x_[static_cast<size_t>(t0 + j) * gates];
     }
+    RowsProduct(in, 1, width, g.w_ih.data(), input_gate_stride_, g.b_ih.data(), gates, out);
   }
   std::fill(state_.begin(), state_.end(), 0.0f);
   for (int step = 0; step < n; ++step) {
     const int t = reverse ? n - 1 - step : step;
-    std::copy_n(g.b_hh.data(), 3 * hid, gates_h_.data());
-    for (size_t i = 0; i < hid; ++i) Axpy(state_[i], &g.w_hh[i * 3 * hid], gates_h_.data(), 3 * hid);
-    const float* gx = &gates_x_[t * 3 * hid];
+    StateProduct(state_.data(), hid, g.w_hh.data(), state_gate_stride_, g.b_hh.data(), gates, gates_h_.data());
+    const float* gx = &gates_x_[t * gates];
     const float* gh = gates_h_.data();
-    float* out = &feat_[t * feat + out_offset];
+    float* o = &feat_[t * feat + out_offset];
     for (size_t j = 0; j < hid; ++j) {
       const float r = Sigmoid(gx[j] + gh[j]);
       const float z = Sigmoid(gx[hid + j] + gh[hid + j]);
       const float cand = std::tanh(gx[2 * hid + j] + r * gh[2 * hid + j]);
       state_[j] = (1.0f - z) * cand + z * state_[j];
-      out[j] = state_[j];
+      o[j] = state_[j];
     }
   }
 }

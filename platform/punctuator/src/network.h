@@ -51,7 +51,8 @@ class Network {
 
  private:
   struct Gru {
-    std::vector<float> w_ih, w_hh, b_ih, b_hh;  // gates r, z, n as stored
+    // [input][gate], gates r, z, n as stored, padded to the gate strides.
+    std::vector<float> w_ih, w_hh, b_ih, b_hh;
   };
 
   void Embed(const WordInput* words, int n);
@@ -61,12 +62,15 @@ class Network {
   NetworkShape shape_;
   std::vector<float> word_emb_, piece_emb_;
   // Per layer, [kernel tap][input channel][output channel], so a tap is a
-  // row of multiply-adds over contiguous outputs.
+  // row of multiply-adds over contiguous outputs; outputs padded to
+  // conv_stride_ (the GRU's to its two gate strides) so products run in
+  // whole tiles.
   std::vector<std::vector<float>> conv_w_, conv_b_;
+  size_t conv_stride_ = 0, input_gate_stride_ = 0, state_gate_stride_ = 0;
   Gru forward_, backward_;
   std::vector<float> punct_w_, punct_b_, case_w_, case_b_;
 
-  std::vector<float> act_a_, act_b_, feat_, gates_x_, gates_h_, state_;
+  std::vector<float> act_a_, act_b_, zeros_, feat_, gates_x_, gates_h_, state_;
 };
 
 }  // namespace punct
