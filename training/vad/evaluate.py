@@ -59,26 +59,29 @@ def late_onsets(labels, detected):
 
 
 def load_detector(source_dir, name, kind):
+    """Decisions, scores, emitted-segment flags and energy-gate flags (the
+    last two only for our detector)."""
     if kind == "ours":
         t = frames.load_frame_table(source_dir, name)
-        return t[:, 3], t[:, 1], t[:, 4]  # decision, smoothed score, emitted
+        return t[:, 3], t[:, 1], t[:, 4], t[:, 2]
     p = np.fromfile(os.path.join(source_dir, name + ".prob"), dtype="<f4")
-    return (p >= PROB_THRESHOLD).astype(float), p, None
+    return (p >= PROB_THRESHOLD).astype(float), p, None, None
 
 
 def evaluate(mix_dir, source_dir, kind):
     groups = {}
     for row in read_index(mix_dir):
         labels = frames.load_labels(mix_dir, row["name"])
-        decision, score, emitted = load_detector(source_dir, row["name"], kind)
+        decision, score, emitted, gate = load_detector(source_dir, row["name"], kind)
         n = min(len(labels), len(decision))
-        g = groups.setdefault(row["condition"], {"y": [], "d": [], "s": [], "e": [],
+        g = groups.setdefault(row["condition"], {"y": [], "d": [], "s": [], "e": [], "g": [],
                                                  "late_d": 0, "late_e": 0, "onsets": 0})
         g["y"].append(labels[:n])
         g["d"].append(decision[:n])
         g["s"].append(score[:n])
         if emitted is not None:
             g["e"].append(emitted[:n])
+            g["g"].append(gate[:n])
         late, total = late_onsets(labels[:n], decision[:n])
         g["late_d"] += late
         g["onsets"] += total
@@ -98,6 +101,13 @@ def evaluate(mix_dir, source_dir, kind):
             if e is not None:
                 r["segment_prf"] = metrics.precision_recall_f1(e, y)
                 r["late_onsets_segment"] = g["late_e"] / max(g["onsets"], 1)
+                # Speech too quiet for the fixed energy gate: no network can
+                # pass it, only the segment margins can cover it.
+                speech, closed = y > 0, np.concatenate(g["g"]) == 0
+                missed = speech & (e == 0)
+                r["speech_under_gate"] = float(np.mean(closed[speech]))
+                r["segment_misses_under_gate"] = float(np.mean(closed[missed])) \
+                    if missed.any() else 0.0
         else:
             r["false_alarm_decision"] = float(np.mean(d))
             if e is not None:
@@ -123,6 +133,15 @@ def print_tables(name, result):
         print("| %s | %d | %s | %s | %s | %s | %s | %s | %s | %d | %s | %s |" % (
             cond, r["frames"], *map(fmt, r["decision_prf"]), *map(fmt, seg), fmt(r["auc"]),
             r["onsets"], fmt(r["late_onsets_decision"]), fmt(r.get("late_onsets_segment"))))
+    if any("speech_under_gate" in result.get(c, {}) for c in SPEECH_CONDITIONS):
+        print("\n%s: labelled speech under the energy gate\n" % name)
+        print("| SNR | share of speech frames | share of the segments' missed speech frames |")
+        print("|---|---:|---:|")
+        for cond in SPEECH_CONDITIONS:
+            if cond in result:
+                r = result[cond]
+                print("| %s | %s | %s |" % (cond, fmt(r["speech_under_gate"]),
+                                           fmt(r["segment_misses_under_gate"])))
     print("\n%s: speech-free mixtures (share of frames marked speech)\n" % name)
     print("| kind | frames | decisions | segments |")
     print("|---|---:|---:|---:|")
