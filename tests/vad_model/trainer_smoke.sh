@@ -49,6 +49,11 @@ grep -q "^kept threshold log-odds" priors.txt || { cat priors.txt; exit 1; }
 # The trained model runs in the whole pipeline, and what the dump records is
 # what that pipeline scored.
 mkdir -p deployed
-"$kvasr" vad --vad-models model --dump deployed mix/val/val_speech_clean_000.wav > /dev/null
+"$kvasr" vad --vad-models model --dump deployed mix/val/*.wav > /dev/null
 "$python" "$here/forward_check.py" deployed model deployed/val_speech_clean_000.f32 \
   deployed/val_speech_clean_000.tsv
+# The evaluation train.sh ends with reads those records.
+"$python" "$training/evaluate.py" --mix mix/val --ours deployed --json eval.json > eval.txt
+"$python" -c "import json, sys; r = json.load(open('eval.json'))['kvasr']
+sys.exit(not (0 <= r['clean']['speech_under_gate'] <= 1 and 'false_alarm_segment' in r['music']))" \
+  || { cat eval.txt; exit 1; }

@@ -120,36 +120,32 @@ def fmt(v):
     return "—" if v is None or (isinstance(v, float) and np.isnan(v)) else "%.3f" % v
 
 
+def print_table(title, columns, rows):
+    print("\n%s\n" % title)
+    print("| " + " | ".join(columns) + " |")
+    print("|---|" + "---:|" * (len(columns) - 1))
+    for row in rows:
+        print("| " + " | ".join(row) + " |")
+
+
 def print_tables(name, result):
-    print("\n%s: speech mixtures\n" % name)
-    print("| SNR | frames | decision P | decision R | decision F1 | segment P | segment R | "
-          "segment F1 | AUC | onsets | late onsets, decisions | late onsets, segments |")
-    print("|---|---:|---:|---:|---:|---:|---:|---:|---:|---:|---:|---:|")
-    for cond in SPEECH_CONDITIONS:
-        if cond not in result:
-            continue
-        r = result[cond]
-        seg = r.get("segment_prf", (None, None, None))
-        print("| %s | %d | %s | %s | %s | %s | %s | %s | %s | %d | %s | %s |" % (
-            cond, r["frames"], *map(fmt, r["decision_prf"]), *map(fmt, seg), fmt(r["auc"]),
-            r["onsets"], fmt(r["late_onsets_decision"]), fmt(r.get("late_onsets_segment"))))
-    if any("speech_under_gate" in result.get(c, {}) for c in SPEECH_CONDITIONS):
-        print("\n%s: labelled speech under the energy gate\n" % name)
-        print("| SNR | share of speech frames | share of the segments' missed speech frames |")
-        print("|---|---:|---:|")
-        for cond in SPEECH_CONDITIONS:
-            if cond in result:
-                r = result[cond]
-                print("| %s | %s | %s |" % (cond, fmt(r["speech_under_gate"]),
-                                           fmt(r["segment_misses_under_gate"])))
-    print("\n%s: speech-free mixtures (share of frames marked speech)\n" % name)
-    print("| kind | frames | decisions | segments |")
-    print("|---|---:|---:|---:|")
-    for kind in NOSPEECH_KINDS:
-        if kind in result:
-            r = result[kind]
-            print("| %s | %d | %s | %s |" % (kind, r["frames"], fmt(r["false_alarm_decision"]),
-                                             fmt(r.get("false_alarm_segment"))))
+    speech = [(c, result[c]) for c in SPEECH_CONDITIONS if c in result]
+    print_table("%s: speech mixtures" % name, [
+        "SNR", "frames", "decision P", "decision R", "decision F1", "segment P", "segment R",
+        "segment F1", "AUC", "onsets", "late onsets, decisions", "late onsets, segments"], [
+        [c, str(r["frames"]), *map(fmt, r["decision_prf"]),
+         *map(fmt, r.get("segment_prf", (None, None, None))), fmt(r["auc"]), str(r["onsets"]),
+         fmt(r["late_onsets_decision"]), fmt(r.get("late_onsets_segment"))] for c, r in speech])
+    if any("speech_under_gate" in r for _, r in speech):
+        print_table("%s: labelled speech under the energy gate" % name, [
+            "SNR", "share of speech frames", "share of the segments' missed speech frames"], [
+            [c, fmt(r["speech_under_gate"]), fmt(r["segment_misses_under_gate"])]
+            for c, r in speech])
+    print_table("%s: speech-free mixtures (share of frames marked speech)" % name,
+                ["kind", "frames", "decisions", "segments"], [
+                    [k, str(result[k]["frames"]), fmt(result[k]["false_alarm_decision"]),
+                     fmt(result[k].get("false_alarm_segment"))]
+                    for k in NOSPEECH_KINDS if k in result])
 
 
 def main():
