@@ -1,15 +1,21 @@
 #!/bin/sh
-# Trains a tiny model for one epoch on a slice of the corpus into a temporary
-# folder and checks that the library's forward pass agrees with the trainer's.
+# Trains a tiny model the way train.sh does (a convolutional encoder, then a
+# recurrent layer started from it), one epoch each on a slice of the corpus,
+# and checks that the library's forward pass agrees with the trainer's after
+# both stages. The width of 12 channels leaves the library's padded tiles
+# partly empty.
 # Usage: trainer_smoke.sh PYTHON TRAINING_DIR DATA_DIR FORWARD_CHECK
 set -eu
 python=$1 training=$2 data=$3 check=$4
 out=$(mktemp -d /tmp/kvasr-punct-smoke-XXXXXX)
 trap 'rm -rf "$out"' EXIT
-"$python" "$training/train.py" --data "$data" --out "$out" --forward-check "$out/forward.tsv" \
-  --words 20000 --dev-words 3000 --epochs 1 --vocab 2000 --merges 200 \
-  --dim 16 --channels 16 --convs 2 --hidden 8 --threads 1
+common="--data $data --words 20000 --dev-words 3000 --epochs 1 --vocab 2000 --merges 200
+  --dim 16 --channels 12 --convs 2 --threads 1"
+"$python" "$training/train.py" $common --hidden 0 --out "$out/encoder" --forward-check "$out/encoder.tsv"
+"$check" "$out/encoder" "$out/encoder.tsv"
+"$python" "$training/train.py" $common --hidden 8 --init "$out/encoder" --out "$out/model" \
+  --forward-check "$out/model.tsv"
 for f in model.bin vocab.txt punc.txt num.txt case.txt xdb.txt bpe.txt; do
-  test -s "$out/$f"
+  test -s "$out/model/$f"
 done
-"$check" "$out" "$out/forward.tsv"
+"$check" "$out/model" "$out/model.tsv"

@@ -188,6 +188,8 @@ def train(args):
 
     model = PunctNet(len(vocab_words), bpe.size, args.dim, args.channels,
                      args.convs, args.hidden, args.dropout)
+    if args.init:
+        load_encoder(model, args.init, vocab_words)
     opt = torch.optim.Adam(model.parameters(), lr=args.lr)
     loss_fn = nn.CrossEntropyLoss(ignore_index=corpus.IGNORE)
     best_f1, best_state = -1.0, None
@@ -299,6 +301,39 @@ def write_model(path, model, lang):
         f.write(struct.pack("<I", fnv1a(payload)))
 
 
+def load_encoder(model, folder, vocab_words):
+    """Starts the embeddings and convolutions from a model written earlier
+    with the same vocabulary and shape, so a recurrent layer can be trained
+    on top of an encoder that has already seen the whole text many times;
+    the heads start afresh."""
+    with open(os.path.join(folder, "vocab.txt"), encoding="utf-8") as f:
+        if [w.rstrip("\n") for w in f][1:] != vocab_words:
+            sys.exit(f"{folder}: vocabulary differs from this run's")
+    with open(os.path.join(folder, "model.bin"), "rb") as f:
+        blob = f.read()
+    if blob[:8] != MODEL_MAGIC:
+        sys.exit(f"{folder}/model.bin is not a punctuation model")
+    fields = struct.unpack_from("<I4s13I", blob, 8)
+    vocab, pieces, dim, convs, channels, kernel = fields[2:8]
+    want = (model.wemb.num_embeddings, model.pemb.num_embeddings - 1,
+            model.wemb.embedding_dim, len(model.convs),
+            model.convs[0].out_channels if len(model.convs) else 0,
+            CONV_KERNEL)
+    if (vocab, pieces, dim, convs, channels, kernel) != want:
+        sys.exit(f"{folder}/model.bin: encoder shape differs from this run's")
+    values = np.frombuffer(blob, "<f2", offset=8 + struct.calcsize("<I4s13I"))
+    pos = 0
+    targets = [model.wemb.weight, model.pemb.weight[:-1]]
+    for conv in model.convs:
+        targets += [conv.weight, conv.bias]
+    with torch.no_grad():
+        for t in targets:
+            n = t.numel()
+            t.copy_(torch.from_numpy(values[pos:pos + n].astype(np.float32))
+                    .reshape(t.shape))
+            pos += n
+
+
 def write_files(out, model, lex, vocab_words, bpe, case_entries, lang):
     os.makedirs(out, exist_ok=True)
     write_model(os.path.join(out, "model.bin"), model, lang)
@@ -371,6 +406,8 @@ def main():
                     help="stop training after this long and keep the best "
                     "model so far")
     ap.add_argument("--seed", type=int, default=1)
+    ap.add_argument("--init", help="model folder to start the embeddings and "
+                    "convolutions from (same vocabulary and shape)")
     args = ap.parse_args()
     model, lex, vocab_words, bpe, case_entries = train(args)
     write_files(args.out, model, lex, vocab_words, bpe, case_entries,
