@@ -20,6 +20,8 @@ from scoring import f1_scores
 
 MODEL_MAGIC = b"KVPUNCT\0"
 MODEL_VERSION = 1
+# After the magic: version, language, then the 13 shape fields.
+MODEL_HEADER = "<I4s13I"
 # Subword bag of one word: bytes looked at, pieces kept.
 MAX_WORD_BYTES = 48
 MAX_PIECES = 16
@@ -288,7 +290,7 @@ def write_model(path, model, lang):
                 model.case.bias]
     channels = model.convs[0].out_channels if len(model.convs) else 0
     header = MODEL_MAGIC + struct.pack(
-        "<I4s13I", MODEL_VERSION, lang.encode(),
+        MODEL_HEADER, MODEL_VERSION, lang.encode(),
         model.wemb.num_embeddings, model.pemb.num_embeddings - 1,
         model.wemb.embedding_dim, len(model.convs), channels, CONV_KERNEL,
         gru.hidden_size if gru is not None else 0,
@@ -311,9 +313,9 @@ def load_encoder(model, folder, vocab_words):
             sys.exit(f"{folder}: vocabulary differs from this run's")
     with open(os.path.join(folder, "model.bin"), "rb") as f:
         blob = f.read()
-    if blob[:8] != MODEL_MAGIC:
+    if blob[:len(MODEL_MAGIC)] != MODEL_MAGIC:
         sys.exit(f"{folder}/model.bin is not a punctuation model")
-    fields = struct.unpack_from("<I4s13I", blob, 8)
+    fields = struct.unpack_from(MODEL_HEADER, blob, len(MODEL_MAGIC))
     vocab, pieces, dim, convs, channels, kernel = fields[2:8]
     want = (model.wemb.num_embeddings, model.pemb.num_embeddings - 1,
             model.wemb.embedding_dim, len(model.convs),
@@ -321,7 +323,8 @@ def load_encoder(model, folder, vocab_words):
             CONV_KERNEL)
     if (vocab, pieces, dim, convs, channels, kernel) != want:
         sys.exit(f"{folder}/model.bin: encoder shape differs from this run's")
-    values = np.frombuffer(blob, "<f2", offset=8 + struct.calcsize("<I4s13I"))
+    values = np.frombuffer(blob, "<f2",
+                           offset=len(MODEL_MAGIC) + struct.calcsize(MODEL_HEADER))
     pos = 0
     targets = [model.wemb.weight, model.pemb.weight[:-1]]
     for conv in model.convs:
