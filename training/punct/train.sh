@@ -7,7 +7,7 @@
 # Needs Debian's python3-torch and python3-numpy. Two stages over the 4.7M
 # words: the convolutional encoder, eight epochs (25 to 45 minutes on two
 # cores, depending on what else runs); then a bidirectional GRU trained on
-# top of it, two epochs (about 55 minutes).
+# top of it, two epochs (about an hour).
 set -eu
 here=$(cd "$(dirname "$0")" && pwd)
 root=$(cd "$here/../.." && pwd)
