@@ -1,6 +1,7 @@
 // Compares the library's network output with the logits the trainer wrote
 // for the same texts (train.py --forward-check). Exit status 0 when every
-// value agrees within the tolerance.
+// value agrees within the tolerance. With --baseline the products run the
+// code for processors without AVX2.
 #include <algorithm>
 #include <cmath>
 #include <cstdio>
@@ -28,10 +29,12 @@ std::vector<float> ParseFloats(const std::string& s) {
 }  // namespace
 
 int main(int argc, char** argv) {
-  if (argc != 3) {
-    std::cerr << "usage: " << argv[0] << " MODEL_DIR REFERENCE_TSV\n";
+  const bool baseline = argc == 4 && std::string(argv[3]) == "--baseline";
+  if (argc != 3 && !baseline) {
+    std::cerr << "usage: " << argv[0] << " MODEL_DIR REFERENCE_TSV [--baseline]\n";
     return 2;
   }
+  kvasr::punct::UseBaselineProducts(baseline);
   std::string error;
   auto p = kvasr::punct::test::LoadModelDir(argv[1], &error);
   if (!p) {

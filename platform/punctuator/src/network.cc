@@ -1,6 +1,7 @@
 #include "network.h"
 
 #include <algorithm>
+#include <atomic>
 #include <cmath>
 #include <cstring>
 #include <fstream>
@@ -120,12 +121,15 @@ __attribute__((always_inline)) inline void ProductTiles(const float* const* in, 
   }
 }
 
-// Chosen once, at first use: resolvers run by the loader (ifunc) come before
-// sanitizer runtimes are ready, and "arch=" clones dispatch on the CPU model
-// rather than its features.
-bool HasAvx2Fma() {
+// Set by UseBaselineProducts.
+std::atomic<bool> g_baseline_only{false};
+
+// The processor's answer is taken once, at first use: resolvers run by the
+// loader (ifunc) come before sanitizer runtimes are ready, and "arch="
+// clones dispatch on the CPU model rather than its features.
+bool UseAvx2() {
   static const bool has = __builtin_cpu_supports("avx2") && __builtin_cpu_supports("fma");
-  return has;
+  return has && !g_baseline_only.load(std::memory_order_relaxed);
 }
 
 __attribute__((target("avx2,fma"))) void RowsProductAvx2(const float* const* in, int parts, size_t cin,
@@ -142,14 +146,14 @@ __attribute__((target("avx2,fma"))) void StateProductAvx2(const float* in, size_
 
 void RowsProduct(const float* const* in, int parts, size_t cin, const float* w, size_t stride,
                  const float* bias, size_t cout, float* const* out) {
-  if (HasAvx2Fma()) return RowsProductAvx2(in, parts, cin, w, stride, bias, cout, out);
+  if (UseAvx2()) return RowsProductAvx2(in, parts, cin, w, stride, bias, cout, out);
   ProductTiles<Lanes4, kTimeBlock, kRowsOutBlockBaseline>(in, parts, cin, w, stride, bias, cout, out);
 }
 
 // The product of the recurrent state (one row) with a gate matrix.
 void StateProduct(const float* in, size_t cin, const float* w, size_t stride, const float* bias, size_t cout,
                   float* out) {
-  if (HasAvx2Fma()) return StateProductAvx2(in, cin, w, stride, bias, cout, out);
+  if (UseAvx2()) return StateProductAvx2(in, cin, w, stride, bias, cout, out);
   ProductTiles<Lanes4, 1, kStateOutBlockBaseline>(&in, 1, cin, w, stride, bias, cout, &out);
 }
 
@@ -171,6 +175,8 @@ std::vector<float> Padded(std::vector<float> v, size_t size) {
 float Sigmoid(float x) { return 1.0f / (1.0f + std::exp(-x)); }
 
 }  // namespace
+
+void UseBaselineProducts(bool on) { g_baseline_only.store(on, std::memory_order_relaxed); }
 
 bool Network::Load(const std::string& path, std::string* error) {
   std::ifstream in(path, std::ios::binary);
