@@ -275,10 +275,17 @@ def fnv1a(data):
     return h
 
 
-def write_model(path, model, lang):
+def encoder_tensors(model):
+    """The embeddings and convolutions, in file order (they open the
+    weights; the padding row of the piece embedding is not stored)."""
     tensors = [model.wemb.weight, model.pemb.weight[:-1]]
     for conv in model.convs:
         tensors += [conv.weight, conv.bias]
+    return tensors
+
+
+def write_model(path, model, lang):
+    tensors = encoder_tensors(model)
     gru = model.gru
     if gru is not None:
         for sfx in ("", "_reverse"):
@@ -326,11 +333,8 @@ def load_encoder(model, folder, vocab_words):
     values = np.frombuffer(blob, "<f2",
                            offset=len(MODEL_MAGIC) + struct.calcsize(MODEL_HEADER))
     pos = 0
-    targets = [model.wemb.weight, model.pemb.weight[:-1]]
-    for conv in model.convs:
-        targets += [conv.weight, conv.bias]
     with torch.no_grad():
-        for t in targets:
+        for t in encoder_tensors(model):
             n = t.numel()
             t.copy_(torch.from_numpy(values[pos:pos + n].astype(np.float32))
                     .reshape(t.shape))
