@@ -339,6 +339,7 @@ def check_dnn(tool, work):
 
 
 def main():
+    os.makedirs(sys.argv[-1], exist_ok=True)
     if sys.argv[1] == "plp":
         failed = check_plp(sys.argv[2], sys.argv[3], sys.argv[4])
     else:

@@ -9,12 +9,16 @@
 //       returned, possibly negative) and that many rows of floats.
 //   reference_tool dnn NET PRIORS FEAT.f32 FEAT_DIM TOTAL T0 FIRST LAST SKIP
 //       START_OFFSET END_OFFSET OUT.f32
+//
+// With QUELLAN_BASELINE_LOOPS=1 in the environment the loops built for
+// processors without AVX run instead of the AVX ones.
 #include <cstdio>
 #include <cstdlib>
 #include <fstream>
 #include <string>
 #include <vector>
 
+#include "cpu_features.h"
 #include "model_files.h"
 #include "plp.h"
 #include "vad_dnn.h"
@@ -104,6 +108,8 @@ int RunDnn(char** argv) {
 }  // namespace
 
 int main(int argc, char** argv) {
+  const char* baseline = std::getenv("QUELLAN_BASELINE_LOOPS");
+  if (baseline != nullptr && std::string(baseline) == "1") cpu_force_baseline(true);
   const std::string command = argc > 1 ? argv[1] : "";
   if (command == "decode" && argc == 4) return Decode(argv[2], argv[3]);
   if (command == "plp" && argc >= 6) return RunPlp(argc, argv);
