@@ -1,8 +1,8 @@
 #!/bin/sh
-# Trains a tiny model the way train.sh does (a convolutional encoder, then a
-# recurrent layer started from it), one epoch each on a slice of the corpus,
-# and checks that the library's forward pass agrees with the trainer's after
-# both stages. The width of 12 channels leaves the library's padded tiles
+# Trains a tiny model the way train.sh does (a convolutional encoder, a
+# recurrent layer started from it, then the whole network trained on), one
+# epoch each on a slice of the corpus, and checks that the library's forward
+# pass agrees with the trainer's after every stage. The width of 12 channels leaves the library's padded tiles
 # partly empty.
 # Usage: trainer_smoke.sh PYTHON TRAINING_DIR DATA_DIR FORWARD_CHECK
 set -eu
@@ -19,3 +19,7 @@ for f in model.bin vocab.txt punc.txt num.txt case.txt xdb.txt bpe.txt; do
   test -s "$out/model/$f"
 done
 "$check" "$out/model" "$out/model.tsv"
+"$python" "$training/train.py" $common --hidden 8 --init "$out/model" --out "$out/more" \
+  --forward-check "$out/more.tsv" | tee "$out/more.log"
+grep -q "started from $out/model: all weights" "$out/more.log"
+"$check" "$out/more" "$out/more.tsv"

@@ -36,7 +36,7 @@ UNK = 0
 MIN_MIXED_COUNT = 2
 MIN_ALWAYS_COUNT = 5
 ALWAYS_SHARE = 0.95
-O_BIAS_GRID = [x / 10 for x in range(-15, 16)]
+BIAS_GRID = [x / 10 for x in range(-15, 16)]
 HERE = os.path.dirname(os.path.abspath(__file__))
 
 
@@ -191,7 +191,7 @@ def train(args):
     model = PunctNet(len(vocab_words), bpe.size, args.dim, args.channels,
                      args.convs, args.hidden, args.dropout)
     if args.init:
-        load_encoder(model, args.init, vocab_words)
+        load_weights(model, args.init, vocab_words)
     opt = torch.optim.Adam(model.parameters(), lr=args.lr)
     loss_fn = nn.CrossEntropyLoss(ignore_index=corpus.IGNORE)
     best_f1, best_state = -1.0, None
@@ -242,7 +242,7 @@ def train(args):
             best_state = {k: v.clone() for k, v in model.state_dict().items()}
     model.load_state_dict(best_state)
     round_to_half(model)
-    tune_o_bias(model, lex, dev_words, dev_labels)
+    tune_mark_biases(model, lex, dev_words, dev_labels)
     return model, lex, vocab_words, bpe, build_case_lexicon(words, surfaces,
                                                               starts)
 
@@ -255,17 +255,31 @@ def round_to_half(model):
             p.copy_(p.half().float())
 
 
-def tune_o_bias(model, lex, dev_words, dev_labels):
+def tune_mark_biases(model, lex, dev_words, dev_labels):
+    """Shifts the no-mark logit, then each mark's (twice round), to the
+    values that maximise overall F1 on the dev text: the marks trade
+    precision against recall differently, and the shift is cheaper than
+    reweighting the loss and retraining."""
     logits, _ = predict(model, lex, dev_words)
-    best = max(O_BIAS_GRID, key=lambda d: f1_scores(
-        dev_labels, (logits + np.eye(4)[corpus.O] * d).argmax(1))["OVERALL"][2])
+    shift = np.zeros(len(corpus.PUNCT_LABELS), np.float32)
+
+    def overall(label, d):
+        trial = shift.copy()
+        trial[label] = d
+        return f1_scores(dev_labels, (logits + trial).argmax(1))["OVERALL"][2]
+
+    marks = [i for i in range(len(shift)) if i != corpus.O]
+    for label in [corpus.O] + marks + marks:
+        shift[label] = max(BIAS_GRID, key=lambda d: overall(label, d))
     with torch.no_grad():
-        model.punct.bias[corpus.O] += best
+        model.punct.bias += torch.from_numpy(shift)
     round_to_half(model)
     logits, _ = predict(model, lex, dev_words)
     scores = f1_scores(dev_labels, logits.argmax(1))
-    print(f"O bias {best:+.1f}: dev2012 " + ", ".join(
-        f"{k} {100 * v[2]:.1f}" for k, v in scores.items()), flush=True)
+    print("bias shifts " + " ".join(f"{corpus.PUNCT_LABELS[i][0]} {d:+.1f}"
+                                    for i, d in enumerate(shift)) +
+          ": dev2012 " + ", ".join(f"{k} {100 * v[2]:.1f}"
+                                   for k, v in scores.items()), flush=True)
 
 
 def fnv1a(data):
@@ -284,7 +298,9 @@ def encoder_tensors(model):
     return tensors
 
 
-def write_model(path, model, lang):
+def model_tensors(model):
+    """Every stored tensor in file order: the encoder, the GRU if any (each
+    direction's input, recurrent and bias tensors), then the two heads."""
     tensors = encoder_tensors(model)
     gru = model.gru
     if gru is not None:
@@ -293,8 +309,13 @@ def write_model(path, model, lang):
                         getattr(gru, f"weight_hh_l0{sfx}"),
                         getattr(gru, f"bias_ih_l0{sfx}"),
                         getattr(gru, f"bias_hh_l0{sfx}")]
-    tensors += [model.punct.weight, model.punct.bias, model.case.weight,
-                model.case.bias]
+    return tensors + [model.punct.weight, model.punct.bias, model.case.weight,
+                      model.case.bias]
+
+
+def write_model(path, model, lang):
+    tensors = model_tensors(model)
+    gru = model.gru
     channels = model.convs[0].out_channels if len(model.convs) else 0
     header = MODEL_MAGIC + struct.pack(
         MODEL_HEADER, MODEL_VERSION, lang.encode(),
@@ -310,11 +331,13 @@ def write_model(path, model, lang):
         f.write(struct.pack("<I", fnv1a(payload)))
 
 
-def load_encoder(model, folder, vocab_words):
-    """Starts the embeddings and convolutions from a model written earlier
-    with the same vocabulary and shape, so a recurrent layer can be trained
-    on top of an encoder that has already seen the whole text many times;
-    the heads start afresh."""
+def load_weights(model, folder, vocab_words):
+    """Starts the network from a model written earlier with the same
+    vocabulary and encoder shape. With the same GRU width every tensor is
+    taken, so training goes on where that run stopped; otherwise only the
+    embeddings and convolutions are, so a recurrent layer can be trained on
+    top of an encoder that has already seen the whole text many times, and
+    the GRU and heads start afresh."""
     with open(os.path.join(folder, "vocab.txt"), encoding="utf-8") as f:
         if [w.rstrip("\n") for w in f][1:] != vocab_words:
             sys.exit(f"{folder}: vocabulary differs from this run's")
@@ -323,22 +346,26 @@ def load_encoder(model, folder, vocab_words):
     if blob[:len(MODEL_MAGIC)] != MODEL_MAGIC:
         sys.exit(f"{folder}/model.bin is not a punctuation model")
     fields = struct.unpack_from(MODEL_HEADER, blob, len(MODEL_MAGIC))
-    vocab, pieces, dim, convs, channels, kernel = fields[2:8]
+    vocab, pieces, dim, convs, channels, kernel, hidden = fields[2:9]
     want = (model.wemb.num_embeddings, model.pemb.num_embeddings - 1,
             model.wemb.embedding_dim, len(model.convs),
             model.convs[0].out_channels if len(model.convs) else 0,
             CONV_KERNEL)
     if (vocab, pieces, dim, convs, channels, kernel) != want:
         sys.exit(f"{folder}/model.bin: encoder shape differs from this run's")
+    whole = hidden == (model.gru.hidden_size if model.gru is not None else 0)
     values = np.frombuffer(blob, "<f2",
                            offset=len(MODEL_MAGIC) + struct.calcsize(MODEL_HEADER))
     pos = 0
     with torch.no_grad():
-        for t in encoder_tensors(model):
+        for t in model_tensors(model) if whole else encoder_tensors(model):
             n = t.numel()
             t.copy_(torch.from_numpy(values[pos:pos + n].astype(np.float32))
                     .reshape(t.shape))
             pos += n
+    print(f"started from {folder}: "
+          f"{'all weights' if whole else 'embeddings and convolutions'}",
+          flush=True)
 
 
 def write_files(out, model, lex, vocab_words, bpe, case_entries, lang):
@@ -413,8 +440,9 @@ def main():
                     help="stop training after this long and keep the best "
                     "model so far")
     ap.add_argument("--seed", type=int, default=1)
-    ap.add_argument("--init", help="model folder to start the embeddings and "
-                    "convolutions from (same vocabulary and shape)")
+    ap.add_argument("--init", help="model folder to start from (same "
+                    "vocabulary and encoder shape; the GRU and heads too if "
+                    "its GRU has the width asked for)")
     args = ap.parse_args()
     model, lex, vocab_words, bpe, case_entries = train(args)
     write_files(args.out, model, lex, vocab_words, bpe, case_entries,
