@@ -2,8 +2,8 @@
 # Trains a tiny model the way train.sh does (a convolutional encoder, a
 # recurrent layer started from it, then the whole network trained on), one
 # epoch each on a slice of the corpus, and checks that the library's forward
-# pass agrees with the trainer's after every stage. The width of 12 channels leaves the library's padded tiles
-# partly empty.
+# pass agrees with the trainer's after every stage. The width of 12
+# channels leaves the library's padded tiles partly empty.
 # Usage: trainer_smoke.sh PYTHON TRAINING_DIR DATA_DIR FORWARD_CHECK
 set -eu
 python=$1 training=$2 data=$3 check=$4

@@ -313,18 +313,27 @@ def model_tensors(model):
                       model.case.bias]
 
 
-def write_model(path, model, lang):
-    tensors = model_tensors(model)
+# Of the header's shape fields, the first six fix the encoder and the
+# seventh is the GRU width.
+ENCODER_FIELDS = 6
+
+
+def shape_fields(model):
+    """The header's 13 shape fields, in file order."""
     gru = model.gru
-    channels = model.convs[0].out_channels if len(model.convs) else 0
-    header = MODEL_MAGIC + struct.pack(
-        MODEL_HEADER, MODEL_VERSION, lang.encode(),
-        model.wemb.num_embeddings, model.pemb.num_embeddings - 1,
-        model.wemb.embedding_dim, len(model.convs), channels, CONV_KERNEL,
-        gru.hidden_size if gru is not None else 0,
-        len(corpus.PUNCT_LABELS), 4, MAX_WORD_BYTES, MAX_PIECES, WINDOW_STEP,
-        WINDOW_CONTEXT)
-    body = b"".join(t.detach().numpy().astype("<f2").tobytes() for t in tensors)
+    return (model.wemb.num_embeddings, model.pemb.num_embeddings - 1,
+            model.wemb.embedding_dim, len(model.convs),
+            model.convs[0].out_channels if len(model.convs) else 0, CONV_KERNEL,
+            gru.hidden_size if gru is not None else 0,
+            len(corpus.PUNCT_LABELS), 4, MAX_WORD_BYTES, MAX_PIECES, WINDOW_STEP,
+            WINDOW_CONTEXT)
+
+
+def write_model(path, model, lang):
+    header = MODEL_MAGIC + struct.pack(MODEL_HEADER, MODEL_VERSION,
+                                       lang.encode(), *shape_fields(model))
+    body = b"".join(t.detach().numpy().astype("<f2").tobytes()
+                    for t in model_tensors(model))
     payload = header + body
     with open(path, "wb") as f:
         f.write(payload)
@@ -345,15 +354,11 @@ def load_weights(model, folder, vocab_words):
         blob = f.read()
     if blob[:len(MODEL_MAGIC)] != MODEL_MAGIC:
         sys.exit(f"{folder}/model.bin is not a punctuation model")
-    fields = struct.unpack_from(MODEL_HEADER, blob, len(MODEL_MAGIC))
-    vocab, pieces, dim, convs, channels, kernel, hidden = fields[2:9]
-    want = (model.wemb.num_embeddings, model.pemb.num_embeddings - 1,
-            model.wemb.embedding_dim, len(model.convs),
-            model.convs[0].out_channels if len(model.convs) else 0,
-            CONV_KERNEL)
-    if (vocab, pieces, dim, convs, channels, kernel) != want:
+    have = struct.unpack_from(MODEL_HEADER, blob, len(MODEL_MAGIC))[2:]
+    want = shape_fields(model)
+    if have[:ENCODER_FIELDS] != want[:ENCODER_FIELDS]:
         sys.exit(f"{folder}/model.bin: encoder shape differs from this run's")
-    whole = hidden == (model.gru.hidden_size if model.gru is not None else 0)
+    whole = have[ENCODER_FIELDS] == want[ENCODER_FIELDS]
     values = np.frombuffer(blob, "<f2",
                            offset=len(MODEL_MAGIC) + struct.calcsize(MODEL_HEADER))
     pos = 0
