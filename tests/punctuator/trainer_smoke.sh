@@ -1,8 +1,9 @@
 #!/bin/sh
-# Trains a tiny model the way train.sh does (a convolutional encoder, a
-# recurrent layer started from it, then the whole network trained on), one
-# epoch each on a slice of the corpus, and checks that the library's forward
-# pass agrees with the trainer's after every stage. The width of 12
+# Trains a tiny model through each of the trainer's starting points (from
+# scratch without a recurrent layer, a recurrent layer on top of that
+# encoder, then the whole network carried on as train.sh's second run does),
+# one epoch each on a slice of the corpus, and checks that the library's
+# forward pass agrees with the trainer's after every stage. The width of 12
 # channels leaves the library's padded tiles partly empty.
 # Usage: trainer_smoke.sh PYTHON TRAINING_DIR DATA_DIR FORWARD_CHECK
 set -eu
