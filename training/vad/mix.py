@@ -11,6 +11,8 @@ detector analyses. It is speech when the clean, level-scaled utterance has a
 mean square in that window within 35 dB of the utterance's loudest frame;
 non-speech runs shorter than 100 ms inside an utterance are filled. Labels
 come from the speech before mixing and never see the background.
+`--label-range-db` relabels the same audio with another range, to see how
+the figures depend on the rule.
 
 Levels: the active level of an utterance is the RMS over its speech frames.
 A mixture draws one speech level in dBFS (quiet speakers near the detector's
@@ -112,9 +114,26 @@ def background(audio, rows, length, rng):
     return np.tile(x, reps)[start:start + length], row
 
 
-def speech_mixture(audio, speech_rows, noise_rows, target_s, snr_db, rng):
+def utterance_labels(speech, pieces, range_db):
+    labels = np.zeros(frame_count(len(speech)), dtype=np.uint8)
+    for start, clip in pieces:
+        # Frames whose window lies on the utterance, judged on the utterance
+        # alone (the pauses around it are at least 0.1 s).
+        first = -(-start // FRAME_SHIFT_SAMPLES)
+        last = (start + len(clip) - WINDOW_SAMPLES) // FRAME_SHIFT_SAMPLES
+        if last < first:
+            continue
+        p = frame_power(speech[first * FRAME_SHIFT_SAMPLES:
+                               last * FRAME_SHIFT_SAMPLES + WINDOW_SAMPLES])
+        lab = (p >= p.max() * 10 ** (-range_db / 10)).astype(np.uint8)
+        labels[first:last + 1] = fill_short_gaps(lab, FILL_GAP_FRAMES)
+    return labels
+
+
+def speech_mixture(audio, speech_rows, noise_rows, target_s, snr_db, rng,
+                   label_range_db=LABEL_RANGE_DB):
     level_db = rng.uniform(*SPEECH_LEVEL_DBFS)
-    pieces, labels_at = [], []
+    pieces = []
     pos = int(rng.uniform(PAUSE_MIN_S, PAUSE_MAX_S) * RATE_HZ)
     target = int(target_s * RATE_HZ)
     while pos < target:
@@ -127,22 +146,14 @@ def speech_mixture(audio, speech_rows, noise_rows, target_s, snr_db, rng):
         pos += len(clip) + int(rng.uniform(PAUSE_MIN_S, PAUSE_MAX_S) * RATE_HZ)
     length = pos
     speech = np.zeros(length)
-    labels = np.zeros(frame_count(length), dtype=np.uint8)
     for start, clip in pieces:
         speech[start:start + len(clip)] = clip
-    for start, clip in pieces:
-        # Frames whose window lies on the utterance, judged on the utterance
-        # alone (the pauses around it are at least 0.1 s).
-        first = -(-start // FRAME_SHIFT_SAMPLES)
-        last = (start + len(clip) - WINDOW_SAMPLES) // FRAME_SHIFT_SAMPLES
-        if last < first:
-            continue
-        p = frame_power(speech[first * FRAME_SHIFT_SAMPLES:
-                               last * FRAME_SHIFT_SAMPLES + WINDOW_SAMPLES])
-        lab = (p >= p.max() * 10 ** (-LABEL_RANGE_DB / 10)).astype(np.uint8)
-        labels[first:last + 1] = fill_short_gaps(lab, FILL_GAP_FRAMES)
+    labels = utterance_labels(speech, pieces, label_range_db)
+    # The SNR is set against the level the default rule measures, so that a
+    # different label rule relabels the same audio.
+    level_labels = utterance_labels(speech, pieces, LABEL_RANGE_DB)
     p_all = frame_power(speech)
-    speech_level = math.sqrt(np.mean(p_all[labels == 1])) if labels.any() else 1.0
+    speech_level = math.sqrt(np.mean(p_all[level_labels == 1])) if level_labels.any() else 1.0
     if snr_db is None:
         noise = rng_normal(rng, length) * rng.uniform(*DITHER_RMS)
         bg = "dither"
@@ -206,6 +217,9 @@ def main():
                     help="speech-free mixtures of each kind (music, noise, silence)")
     ap.add_argument("--seconds", type=float, default=30.0)
     ap.add_argument("--seed", type=int, default=1)
+    ap.add_argument("--label-range-db", type=float, default=LABEL_RANGE_DB,
+                    help="label rule's range below the utterance's loudest frame; only the "
+                         "labels change, the audio and its levels do not")
     args = ap.parse_args()
 
     rows = corpus.split(corpus.read_manifest(args.corpus))[args.part]
@@ -223,7 +237,8 @@ def main():
         for snr in SNRS_DB:
             cond = "clean" if snr is None else "%gdB" % snr
             for i in range(args.speech_mixtures):
-                mix, lab, meta = speech_mixture(audio, speech, noise, args.seconds, snr, rng)
+                mix, lab, meta = speech_mixture(audio, speech, noise, args.seconds, snr, rng,
+                                                args.label_range_db)
                 meta.update(kind="speech", condition=cond)
                 write(args.out, "%s_speech_%s_%03d" % (args.part, cond, i), mix, lab, meta, index)
         for kind, pool in (("music", music), ("noise", plain_noise), ("silence", None)):
