@@ -33,9 +33,23 @@ for part in train val; do
   mkdir -p dump/$part
   "$kvasr" vad --vad-models table --dump dump/$part mix/$part/*.wav > /dev/null
 done
+# A frame of weight 2 must pull as hard as the same frame given twice.
+PYTHONPATH=$training "$python" -c "
+import numpy as np, network
+rng = np.random.default_rng(3)
+net = network.Network(5, [4], rng)
+x = rng.standard_normal((3, 5)).astype(np.float32)
+y = np.array([1, 0, 1])
+twice = [0, 0, 1, 2]
+a = net.gradients(x, y, np.array([2.0, 1.0, 1.0]))
+b = net.gradients(x[twice], y[twice], np.ones(4))
+assert np.isclose(a[0], b[0]), (a[0], b[0])
+for ga, gb in zip(a[1] + a[2], b[1] + b[2]):
+    assert np.allclose(ga, gb, atol=1e-6), np.abs(ga - gb).max()
+"
 rows=$(ls dump/val/*.f32 | head -n 1)
 "$python" "$training/train.py" --mix mix --dump dump --table table/quellan_data_a \
-  --out model --hidden 8,4 --max-steps 60 --batch 64 \
+  --out model --hidden 8,4 --max-steps 60 --batch 64 --nospeech-weight 3 \
   --check-rows "$rows" --check-scores trainer_scores.f32
 for f in quellan_data_a quellan_data_b quellan_data_c; do
   [ -s model/$f ] || { echo "model/$f missing"; exit 1; }

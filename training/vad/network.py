@@ -34,17 +34,19 @@ class Network:
                 keep.append(h)
         return h @ self.weights[-1] + self.biases[-1]
 
-    def gradients(self, x, y):
-        """Mean cross-entropy of labels y and its gradients."""
+    def gradients(self, x, y, weight):
+        """Cross-entropy of labels y, averaged with per-frame weights, and its
+        gradients."""
         acts = [x]
         z = self.logits(x, acts)
         z = z - z.max(axis=1, keepdims=True)
         p = np.exp(z)
         p /= p.sum(axis=1, keepdims=True)
-        loss = -np.mean(np.log(p[np.arange(len(y)), y] + 1e-12))
+        share = weight / weight.sum()
+        loss = -np.sum(share * np.log(p[np.arange(len(y)), y] + 1e-12))
         d = p
         d[np.arange(len(y)), y] -= 1.0
-        d /= len(y)
+        d *= share[:, None]
         gw, gb = [], []
         for i in range(len(self.weights) - 1, -1, -1):
             gw.append(acts[i].T @ d)

@@ -23,6 +23,7 @@ import network
 
 SCORE_THRESHOLD = -1.0  # the detector's threshold on the smoothed score
 INPUT_SCALE_SAMPLE = 200000
+NOSPEECH_KINDS = ("music", "noise", "silence")
 
 
 def parse_hidden(text):
@@ -54,7 +55,8 @@ def train_one(hidden, train, val, priors, args, rng):
         for i in range(0, len(order), args.batch):
             which = np.sort(order[i:i + args.batch])
             x = (train.inputs(which) - mean) / scale
-            loss, gw, gb = net.gradients(x.astype(np.float32), train.labels[which])
+            loss, gw, gb = net.gradients(x.astype(np.float32), train.labels[which],
+                                         train.weights[which])
             opt.step(gw + gb)
             losses.append(loss)
             steps += 1
@@ -73,6 +75,15 @@ def train_one(hidden, train, val, priors, args, rng):
         if args.max_steps and steps >= args.max_steps:
             break
     return best
+
+
+def frame_weights(frame_set, mix_dir, nospeech_weight):
+    """Loss weight of every frame: those of the speech-free mixtures count
+    `nospeech_weight` times. The false alarms come from a few dozen music and
+    noise files, which a plain mean over all frames lets the speech outvote."""
+    free = set(frames.mixture_names(mix_dir, NOSPEECH_KINDS))
+    ids = [i for i, name in enumerate(frames.mixture_names(mix_dir)) if name in free]
+    return np.where(np.isin(frame_set.owner, ids), nospeech_weight, 1.0)
 
 
 def write_model(out_dir, table, net, priors):
@@ -99,6 +110,8 @@ def main():
     ap.add_argument("--lr-decay", type=float, default=0.6)
     ap.add_argument("--max-steps", type=int, default=0, help="stop after this many steps (smoke runs)")
     ap.add_argument("--max-mixtures", type=int, default=0, help="use only this many mixtures per part")
+    ap.add_argument("--nospeech-weight", type=float, default=1.0,
+                    help="loss weight of the frames of speech-free mixtures")
     ap.add_argument("--seed", type=int, default=1)
     ap.add_argument("--report", help="write the comparison of sizes here (JSON)")
     ap.add_argument("--check-rows", help="feature rows (float32, 39 a frame) of one utterance")
@@ -116,6 +129,7 @@ def main():
         sets[part] = frames.FrameSet(os.path.join(args.mix, part),
                                      os.path.join(args.dump, part), names)
     train, val = sets["train"], sets["val"]
+    train.weights = frame_weights(train, os.path.join(args.mix, "train"), args.nospeech_weight)
     speech_share = float(np.mean(train.labels))
     priors = np.array([1.0 - speech_share, speech_share], dtype=np.float32)
     print("train frames %d (speech %.3f), val frames %d" % (len(train), speech_share, len(val)))
