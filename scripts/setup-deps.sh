@@ -12,7 +12,7 @@ packages=(
   libpocketsphinx-dev pocketsphinx-en-us pocketsphinx-testdata
   python3 python3-numpy python3-soundfile python3-torch gnuplot-nox
   # torch's products go through the system BLAS; the reference one that
-  # comes with it is 30 times slower than OpenBLAS on the trainers' shapes.
+  # comes with it trains the punctuation network thirteen times slower.
   libopenblas0-openmp
   binutils
 )

@@ -24,7 +24,6 @@ ONSET_GAP_FRAMES = 10   # non-speech before a labelled onset
 ONSET_LATE_FRAMES = 10  # 100 ms
 PROB_THRESHOLD = 0.5
 SPEECH_CONDITIONS = ("clean", "20dB", "10dB", "5dB", "0dB")
-NOSPEECH_KINDS = ("music", "noise", "silence")
 
 
 def read_index(mix_dir):
@@ -145,7 +144,7 @@ def print_tables(name, result):
                 ["kind", "frames", "decisions", "segments"], [
                     [k, str(result[k]["frames"]), fmt(result[k]["false_alarm_decision"]),
                      fmt(result[k].get("false_alarm_segment"))]
-                    for k in NOSPEECH_KINDS if k in result])
+                    for k in frames.NOSPEECH_KINDS if k in result])
 
 
 def main():

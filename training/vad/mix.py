@@ -151,7 +151,8 @@ def speech_mixture(audio, speech_rows, noise_rows, target_s, snr_db, rng,
     labels = utterance_labels(speech, pieces, label_range_db)
     # The SNR is set against the level the default rule measures, so that a
     # different label rule relabels the same audio.
-    level_labels = utterance_labels(speech, pieces, LABEL_RANGE_DB)
+    level_labels = labels if label_range_db == LABEL_RANGE_DB else \
+        utterance_labels(speech, pieces, LABEL_RANGE_DB)
     p_all = frame_power(speech)
     speech_level = math.sqrt(np.mean(p_all[level_labels == 1])) if level_labels.any() else 1.0
     if snr_db is None:

@@ -23,7 +23,6 @@ import network
 
 SCORE_THRESHOLD = -1.0  # the detector's threshold on the smoothed score
 INPUT_SCALE_SAMPLE = 200000
-NOSPEECH_KINDS = ("music", "noise", "silence")
 
 
 def parse_hidden(text):
@@ -39,7 +38,7 @@ def evaluate(net, priors, data, batch=65536):
     return acc, metrics.roc_auc(scores, data.labels)
 
 
-def train_one(hidden, train, val, priors, args, rng):
+def train_one(hidden, train, weights, val, priors, args, rng):
     sample = rng.choice(len(train), size=min(len(train), INPUT_SCALE_SAMPLE), replace=False)
     x_sample = train.inputs(np.sort(sample))
     mean = x_sample.mean(axis=0)
@@ -56,7 +55,7 @@ def train_one(hidden, train, val, priors, args, rng):
             which = np.sort(order[i:i + args.batch])
             x = (train.inputs(which) - mean) / scale
             loss, gw, gb = net.gradients(x.astype(np.float32), train.labels[which],
-                                         train.weights[which])
+                                         weights[which])
             opt.step(gw + gb)
             losses.append(loss)
             steps += 1
@@ -81,7 +80,7 @@ def frame_weights(frame_set, mix_dir, nospeech_weight):
     """Loss weight of every frame: those of the speech-free mixtures count
     `nospeech_weight` times. The false alarms come from a few dozen music and
     noise files, which a plain mean over all frames lets the speech outvote."""
-    free = set(frames.mixture_names(mix_dir, NOSPEECH_KINDS))
+    free = set(frames.mixture_names(mix_dir, frames.NOSPEECH_KINDS))
     ids = [i for i, name in enumerate(frames.mixture_names(mix_dir)) if name in free]
     return np.where(np.isin(frame_set.owner, ids), nospeech_weight, 1.0)
 
@@ -129,7 +128,7 @@ def main():
         sets[part] = frames.FrameSet(os.path.join(args.mix, part),
                                      os.path.join(args.dump, part), names)
     train, val = sets["train"], sets["val"]
-    train.weights = frame_weights(train, os.path.join(args.mix, "train"), args.nospeech_weight)
+    weights = frame_weights(train, os.path.join(args.mix, "train"), args.nospeech_weight)
     speech_share = float(np.mean(train.labels))
     priors = np.array([1.0 - speech_share, speech_share], dtype=np.float32)
     print("train frames %d (speech %.3f), val frames %d" % (len(train), speech_share, len(val)))
@@ -138,7 +137,7 @@ def main():
     kept = None
     for text in hidden_choices:
         hidden = parse_hidden(text)
-        acc, auc, net, epoch = train_one(hidden, train, val, priors, args, rng)
+        acc, auc, net, epoch = train_one(hidden, train, weights, val, priors, args, rng)
         cost = net.multiply_adds()
         results.append({"hidden": text, "val_accuracy": acc, "val_auc": auc,
                         "epoch": epoch, "multiply_adds_per_evaluation": cost})

@@ -23,7 +23,6 @@ import numpy as np
 import evaluate
 import model_io
 
-SPEECH_CONDITIONS = ("clean", "20dB", "10dB", "5dB", "0dB")
 # Mean F1 differences this small on the val mixtures change with the BLAS
 # library's rounding, while the false alarms between neighbouring thresholds
 # differ by a third: a near tie goes to the stricter threshold.
@@ -48,7 +47,8 @@ def score(kvasr, model_dir, mix_dir, work, threshold_logit):
     subprocess.run([kvasr, "vad", "--vad-models", trial, "--dump", dump] + wavs,
                    check=True, stdout=subprocess.DEVNULL)
     result = evaluate.evaluate(mix_dir, dump, "ours")
-    return float(np.mean([result[c]["decision_prf"][2] for c in SPEECH_CONDITIONS])), result
+    f1 = [result[c]["decision_prf"][2] for c in evaluate.SPEECH_CONDITIONS]
+    return float(np.mean(f1)), result
 
 
 def main():
