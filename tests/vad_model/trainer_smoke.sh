@@ -47,6 +47,26 @@ assert np.isclose(a[0], b[0]), (a[0], b[0])
 for ga, gb in zip(a[1] + a[2], b[1] + b[2]):
     assert np.allclose(ga, gb, atol=1e-6), np.abs(ga - gb).max()
 "
+# The decision loss's gradients against finite differences of the loss.
+PYTHONPATH=$training "$python" -c "
+import numpy as np, network, decision
+rng = np.random.default_rng(5)
+net = network.Network(6, [5], rng)
+x = (rng.standard_normal((8, 6)) * 2).astype(np.float32)
+y = rng.integers(0, 2, (2, 12)).astype(float)
+w = rng.integers(0, 2, (2, 12)).astype(float)
+_, gw, gb = decision.gradients(net, x, y, w)
+for p, g in zip(net.weights + net.biases, gw + gb):
+    for i in np.ndindex(p.shape):
+        old = p[i]
+        p[i] = old + 1e-2
+        up = decision.gradients(net, x, y, w)[0]
+        p[i] = old - 1e-2
+        down = decision.gradients(net, x, y, w)[0]
+        p[i] = old
+        numeric = (up - down) / 2e-2
+        assert abs(numeric - g[i]) <= 1e-3 * (abs(numeric) + 1e-3), (i, numeric, g[i])
+"
 rows=$(ls dump/val/*.f32 | head -n 1)
 "$python" "$training/train.py" --mix mix --dump dump --table table/quellan_data_a \
   --out model --hidden 8,4 --max-steps 60 --batch 64 --nospeech-weight 3 \
@@ -55,6 +75,10 @@ for f in quellan_data_a quellan_data_b quellan_data_c; do
   [ -s model/$f ] || { echo "model/$f missing"; exit 1; }
 done
 "$python" "$here/forward_check.py" trained "$forward_tool" model "$rows" trainer_scores.f32
+# The second training step: from that network, through the decision stage.
+"$python" "$training/train.py" --mix mix --dump dump --table table/quellan_data_a \
+  --out tuned --hidden 8,4 --init model --loss decision --max-steps 3 --batch 2 > tuned.txt
+cmp -s model/quellan_data_b tuned/quellan_data_b && { echo "fine-tuning changed nothing"; exit 1; }
 before=$(od -An -tx1 model/quellan_data_c)
 "$python" "$training/tune_priors.py" --kvasr "$kvasr" --model model --mix mix/val \
   --work priors --thresholds -1 1 > priors.txt
@@ -66,6 +90,14 @@ mkdir -p deployed
 "$kvasr" vad --vad-models model --dump deployed mix/val/*.wav > /dev/null
 "$python" "$here/forward_check.py" deployed model deployed/val_speech_clean_000.f32 \
   deployed/val_speech_clean_000.tsv
+# The decision stage the decision loss is taken through is the detector's.
+PYTHONPATH=$training "$python" -c "
+import sys, numpy as np, decision
+for path in sys.argv[1:]:
+    t = np.loadtxt(path, skiprows=1, ndmin=2)
+    d = decision.decisions(t[::decision.EVAL_STRIDE_FRAMES, 1], t[:, 3])
+    assert np.array_equal(d, t[:, 4] > 0), (path, np.flatnonzero(d != (t[:, 4] > 0))[:10])
+" deployed/*.tsv
 # The evaluation train.sh ends with reads those records.
 "$python" "$training/evaluate.py" --mix mix/val --ours deployed --json eval.json > eval.txt
 "$python" -c "import json, sys; r = json.load(open('eval.json'))['kvasr']

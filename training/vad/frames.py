@@ -37,26 +37,33 @@ def splice_index(frames, offset=0):
 
 
 class FrameSet:
-    """All frames of a set of mixtures: rows, splice index and labels."""
+    """All frames of a set of mixtures: rows, splice index, labels and the
+    energy gate's flags; `spans` gives each mixture's (name, first frame,
+    frame count)."""
 
     def __init__(self, mix_dir, dump_dir, names):
-        rows, index, labels, owner = [], [], [], []
+        rows, index, labels, owner, gate = [], [], [], [], []
+        self.spans = []
         offset = 0
         for i, name in enumerate(names):
             x = load_rows(dump_dir, name)
             y = load_labels(mix_dir, name)
-            n = min(len(x), len(y))
+            g = load_frame_table(dump_dir, name)[:, 2]
+            n = min(len(x), len(y), len(g))
             if n == 0:
                 continue
             rows.append(x[:n])
             labels.append(y[:n])
+            gate.append(g[:n].astype(np.uint8))
             index.append(splice_index(n, offset))
             owner.append(np.full(n, i, dtype=np.int32))
+            self.spans.append((name, offset, n))
             offset += n
         self.rows = np.concatenate(rows)
         self.index = np.concatenate(index)
         self.labels = np.concatenate(labels).astype(np.int64)
         self.owner = np.concatenate(owner)
+        self.gate = np.concatenate(gate)
 
     def __len__(self):
         return len(self.labels)

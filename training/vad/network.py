@@ -47,13 +47,25 @@ class Network:
         d = p
         d[np.arange(len(y)), y] -= 1.0
         d *= share[:, None]
+        gw, gb = self.backward(acts, d)
+        return loss, gw, gb
+
+    def backward(self, acts, d):
+        """Gradients of the weights and biases from those of the logits `d`,
+        given the activations `logits(x, acts)` kept (acts starting as [x])."""
         gw, gb = [], []
         for i in range(len(self.weights) - 1, -1, -1):
             gw.append(acts[i].T @ d)
             gb.append(d.sum(axis=0))
             if i > 0:
                 d = (d @ self.weights[i].T) * acts[i] * (1.0 - acts[i])
-        return loss, gw[::-1], gb[::-1]
+        return gw[::-1], gb[::-1]
+
+    def unfold_input_scaling(self, mean, scale):
+        """The inverse of fold_input_scaling: makes a network that takes
+        unscaled inputs take (x - mean) / scale."""
+        self.biases[0] = (self.biases[0] + mean @ self.weights[0]).astype(np.float32)
+        self.weights[0] = (self.weights[0] * scale[:, None]).astype(np.float32)
 
     def fold_input_scaling(self, mean, scale):
         """Makes the first layer take unscaled inputs x where it was trained on

@@ -2,11 +2,16 @@
 
 Inputs are the dumps of `kvasr vad --dump` over the train and val mixtures
 (the rows the network's inputs are spliced from) and the mixtures' labels.
-Writes quellan_data_b (network) and quellan_data_c (class priors, the label
-frequencies of the training frames) to --out, next to the given mean table,
-which it copies as quellan_data_a. With several --hidden choices it trains
-each and prints accuracy against cost on val, then keeps the one given by
---keep.
+Writes quellan_data_b (network) and quellan_data_c (class priors) to --out,
+next to the given mean table, which it copies as quellan_data_a. With several
+--hidden choices it trains each and prints accuracy against cost on val, then
+keeps the one given by --keep.
+
+Two losses: `frame`, the cross-entropy of single frames drawn at random
+(priors: the label frequencies); and `decision`, the cross-entropy of the
+detector's own smoothed, gated decisions over pieces of consecutive frames
+(decision.py; priors equal), which train.sh uses to fine-tune a network the
+frame loss trained (--init).
 """
 import argparse
 import json
@@ -16,12 +21,13 @@ import time
 
 import numpy as np
 
+import decision
 import frames
 import metrics
 import model_io
 import network
+from evaluate import SPEECH_CONDITIONS, read_index
 
-SCORE_THRESHOLD = -1.0  # the detector's threshold on the smoothed score
 INPUT_SCALE_SAMPLE = 200000
 
 
@@ -29,33 +35,63 @@ def parse_hidden(text):
     return [int(h) for h in text.split(",") if h]
 
 
-def evaluate(net, priors, data, batch=65536):
+def validate(net, priors, data, conditions, batch=65536):
+    """Val figures: accuracy and AUC of the single-frame scores, and the
+    detector's decisions (smoothing and energy gate as deployed) as F1
+    averaged over the speech conditions."""
     scores = np.concatenate([
         network.detector_scores(net.weights, net.biases, priors,
                                 data.inputs(slice(i, i + batch)))
         for i in range(0, len(data), batch)])
-    acc = float(np.mean((scores > SCORE_THRESHOLD) == (data.labels == 1)))
-    return acc, metrics.roc_auc(scores, data.labels)
+    acc = float(np.mean((scores > decision.SCORE_THRESHOLD) == (data.labels == 1)))
+    by_condition = {}
+    for name, offset, count in data.spans:
+        frames_of = slice(offset, offset + count)
+        d = decision.decisions(scores[frames_of][::decision.EVAL_STRIDE_FRAMES],
+                               data.gate[frames_of])
+        by_condition.setdefault(conditions[name], []).append((d, data.labels[frames_of]))
+    f1 = [metrics.precision_recall_f1(np.concatenate([d for d, _ in pairs]),
+                                      np.concatenate([y for _, y in pairs]))[2]
+          for c, pairs in by_condition.items() if c in SPEECH_CONDITIONS]
+    return {"accuracy": acc, "auc": metrics.roc_auc(scores, data.labels),
+            "decision_f1": float(np.mean(f1)) if f1 else float("nan")}
 
 
-def train_one(hidden, train, weights, val, priors, args, rng):
+def frame_batches(train, weights, batch, rng):
+    """(frames, gradient function) for random batches of single frames."""
+    order = rng.permutation(len(train))
+    for i in range(0, len(order), batch):
+        which = np.sort(order[i:i + batch])
+        yield which, lambda net, x, y=train.labels[which], w=weights[which]: \
+            net.gradients(x, y, w)
+
+
+def train_one(hidden, train, weights, val, conditions, priors, args, rng):
     sample = rng.choice(len(train), size=min(len(train), INPUT_SCALE_SAMPLE), replace=False)
     x_sample = train.inputs(np.sort(sample))
     mean = x_sample.mean(axis=0)
     scale = x_sample.std(axis=0) + 1e-3
     net = network.Network(x_sample.shape[1], hidden, rng)
+    if args.init:
+        net.weights, net.biases = model_io.read_network(os.path.join(args.init, "quellan_data_b"))
+        if net.hidden != hidden:
+            raise SystemExit("--init has hidden layers %s, not %s" % (net.hidden, hidden))
+        net.unfold_input_scaling(mean, scale)
     opt = network.Adam(net.weights + net.biases, args.lr)
+    pieces = decision.Pieces(train) if args.loss == "decision" else None
+    # The frame loss keeps the epoch whose single-frame decisions are most
+    # often right; the decision loss the one whose detector decisions are.
+    criterion = "decision_f1" if pieces else "accuracy"
     best = None
     steps = 0
     started = time.time()
     for epoch in range(args.epochs):
-        order = rng.permutation(len(train))
+        batches = pieces.batches(train, weights, args.batch, rng) if pieces \
+            else frame_batches(train, weights, args.batch, rng)
         losses = []
-        for i in range(0, len(order), args.batch):
-            which = np.sort(order[i:i + args.batch])
+        for which, gradients in batches:
             x = (train.inputs(which) - mean) / scale
-            loss, gw, gb = net.gradients(x.astype(np.float32), train.labels[which],
-                                         weights[which])
+            loss, gw, gb = gradients(net, x.astype(np.float32))
             opt.step(gw + gb)
             losses.append(loss)
             steps += 1
@@ -66,11 +102,13 @@ def train_one(hidden, train, weights, val, priors, args, rng):
         exported.weights = [w.copy() for w in net.weights]
         exported.biases = [b.copy() for b in net.biases]
         exported.fold_input_scaling(mean, scale)
-        acc, auc = evaluate(exported, priors, val)
-        print("hidden %s epoch %d: train loss %.4f, val accuracy %.4f, val AUC %.4f (%.0f s)"
-              % (hidden, epoch + 1, np.mean(losses), acc, auc, time.time() - started), flush=True)
-        if best is None or acc > best[0]:
-            best = (acc, auc, exported, epoch + 1)
+        figures = validate(exported, priors, val, conditions)
+        print("hidden %s epoch %d: train loss %.4f, val accuracy %.4f, AUC %.4f, "
+              "decision F1 %.4f (%.0f s)"
+              % (hidden, epoch + 1, np.mean(losses), figures["accuracy"], figures["auc"],
+                 figures["decision_f1"], time.time() - started), flush=True)
+        if best is None or figures[criterion] > best[0][criterion]:
+            best = (figures, exported, epoch + 1)
         if args.max_steps and steps >= args.max_steps:
             break
     return best
@@ -104,7 +142,12 @@ def main():
                     help="hidden sizes, comma-separated; repeat to compare several")
     ap.add_argument("--keep", default=None, help="which --hidden to write (default: the first)")
     ap.add_argument("--epochs", type=int, default=4)
-    ap.add_argument("--batch", type=int, default=256)
+    ap.add_argument("--loss", choices=("frame", "decision"), default="frame",
+                    help="cross-entropy of single frames, or of the detector's smoothed "
+                    "decisions on pieces of 3.45 s")
+    ap.add_argument("--batch", type=int, default=256,
+                    help="frames (frame loss) or pieces (decision loss) per step")
+    ap.add_argument("--init", help="model folder whose network training starts from")
     ap.add_argument("--lr", type=float, default=2e-3)
     ap.add_argument("--lr-decay", type=float, default=0.6)
     ap.add_argument("--max-steps", type=int, default=0, help="stop after this many steps (smoke runs)")
@@ -130,26 +173,33 @@ def main():
     train, val = sets["train"], sets["val"]
     weights = frame_weights(train, os.path.join(args.mix, "train"), args.nospeech_weight)
     speech_share = float(np.mean(train.labels))
-    priors = np.array([1.0 - speech_share, speech_share], dtype=np.float32)
+    # The decision loss trains the scores with equal priors; the frame loss
+    # leaves posteriors at the label frequencies. tune_priors.py moves either.
+    priors = np.array([0.5, 0.5] if args.loss == "decision" else
+                      [1.0 - speech_share, speech_share], dtype=np.float32)
+    conditions = {r["name"]: r["condition"] for r in read_index(os.path.join(args.mix, "val"))}
     print("train frames %d (speech %.3f), val frames %d" % (len(train), speech_share, len(val)))
 
     results = []
     kept = None
     for text in hidden_choices:
         hidden = parse_hidden(text)
-        acc, auc, net, epoch = train_one(hidden, train, weights, val, priors, args, rng)
+        figures, net, epoch = train_one(hidden, train, weights, val, conditions, priors,
+                                        args, rng)
         cost = net.multiply_adds()
-        results.append({"hidden": text, "val_accuracy": acc, "val_auc": auc,
+        results.append({"hidden": text, "val_accuracy": figures["accuracy"],
+                        "val_auc": figures["auc"], "val_decision_f1": figures["decision_f1"],
                         "epoch": epoch, "multiply_adds_per_evaluation": cost})
         if text == keep:
             kept = net
         if len(hidden_choices) > 1:
             write_model(os.path.join(args.out, "hidden_" + text.replace(",", "x")),
                         args.table, net, priors)
-    print("\nhidden\tval accuracy\tval AUC\tmultiply-adds per evaluation")
+    print("\nhidden\tval accuracy\tval AUC\tval decision F1\tmultiply-adds per evaluation")
     for r in results:
-        print("%s\t%.4f\t%.4f\t%d" % (r["hidden"], r["val_accuracy"], r["val_auc"],
-                                      r["multiply_adds_per_evaluation"]))
+        print("%s\t%.4f\t%.4f\t%.4f\t%d" % (r["hidden"], r["val_accuracy"], r["val_auc"],
+                                            r["val_decision_f1"],
+                                            r["multiply_adds_per_evaluation"]))
     if kept is None:
         raise SystemExit("--keep %s is not among --hidden" % keep)
     write_model(args.out, args.table, kept, priors)

@@ -8,7 +8,7 @@
 # /tmp/kvasr-vad-train (mixtures and dumps, about 4 GB; never committed).
 # Set KVASR to use an existing kvasr binary; otherwise one is built in
 # build-vadtrain/. Set HIDDEN (e.g. "32 64,32") to compare sizes; the first
-# is shipped. About 15 minutes on one core with OpenBLAS, plus the build.
+# is shipped. About 17 minutes on one core with OpenBLAS, plus the build.
 set -euo pipefail
 here=$(cd "$(dirname "$0")" && pwd)
 repo=$(cd "$here/../.." && pwd)
@@ -36,7 +36,7 @@ for counts in "train 200 240" "val 6 4" "dev 20 10"; do
 done
 
 echo "== mean table (first pass over the training mixtures)"
-rm -rf seed pass1 table dump model priors eval
+rm -rf seed pass1 table dump frame-model model priors eval
 "$python" "$here/mean_table.py" seed seed
 mkdir -p pass1 table
 "$KVASR" vad --vad-models seed --dump pass1 mix/train/*.wav > /dev/null
@@ -53,7 +53,12 @@ echo "== training"
 args=()
 for h in "${hidden[@]}"; do args+=(--hidden "$h"); done
 "$python" "$here/train.py" --mix mix --dump dump --table table/quellan_data_a \
-  --out model "${args[@]}" --epochs 40 --lr-decay 0.92 --nospeech-weight 3 --report training.json
+  --out frame-model "${args[@]}" --epochs 40 --lr-decay 0.92 --nospeech-weight 3 \
+  --report training.json
+echo "== fine-tuning through the detector's smoothing and energy gate"
+"$python" "$here/train.py" --mix mix --dump dump --table table/quellan_data_a \
+  --out model --hidden "${hidden[0]}" --init frame-model --loss decision --batch 4 \
+  --epochs 8 --lr 5e-4 --lr-decay 0.85 --nospeech-weight 10 --report fine-tuning.json
 
 echo "== class priors (the detector's operating point, chosen on val)"
 "$python" "$here/tune_priors.py" --kvasr "$KVASR" --model model --mix mix/val --work priors
