@@ -9,7 +9,9 @@ SPEECH, NON_SPEECH = 1, 0
 
 
 def sigmoid(x):
-    return 1.0 / (1.0 + np.exp(-x))
+    # exp overflows to inf for very negative x, which gives the right 0.
+    with np.errstate(over="ignore"):
+        return 1.0 / (1.0 + np.exp(-x))
 
 
 class Network:
