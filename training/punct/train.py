@@ -2,6 +2,7 @@
 punctuation library loads (formats: platform/punctuator/README.md)."""
 
 import argparse
+import hashlib
 import os
 import random
 import shutil
@@ -191,7 +192,7 @@ def train(args):
     model = PunctNet(len(vocab_words), bpe.size, args.dim, args.channels,
                      args.convs, args.hidden, args.dropout)
     if args.init:
-        load_weights(model, args.init, vocab_words)
+        load_weights(model, args.init, vocab_words, args.lang)
     opt = torch.optim.Adam(model.parameters(), lr=args.lr)
     loss_fn = nn.CrossEntropyLoss(ignore_index=corpus.IGNORE)
     best_f1, best_state = -1.0, None
@@ -340,7 +341,7 @@ def write_model(path, model, lang):
         f.write(struct.pack("<I", fnv1a(payload)))
 
 
-def load_weights(model, folder, vocab_words):
+def load_weights(model, folder, vocab_words, lang):
     """Starts the network from a model written earlier with the same
     vocabulary and encoder shape. With the same GRU width every tensor is
     taken, so training goes on where that run stopped; otherwise only the
@@ -348,7 +349,7 @@ def load_weights(model, folder, vocab_words):
     top of an encoder that has already seen the whole text many times, and
     the GRU and heads start afresh."""
     with open(os.path.join(folder, "vocab.txt"), encoding="utf-8") as f:
-        if [w.rstrip("\n") for w in f][1:] != vocab_words:
+        if [w.rstrip("\n") for w in f][1:] != shipped_vocab(vocab_words, lang):
             sys.exit(f"{folder}: vocabulary differs from this run's")
     with open(os.path.join(folder, "model.bin"), "rb") as f:
         blob = f.read()
@@ -373,12 +374,22 @@ def load_weights(model, folder, vocab_words):
           flush=True)
 
 
+def shipped_vocab(vocab_words, lang):
+    """The vocabulary as vocab.txt holds it: the words listed by hash in
+    <lang>/withheld.sha256 become placeholders holding a space, which no
+    token can match; ids, and with them the network, stay as trained."""
+    with open(os.path.join(HERE, lang, "withheld.sha256"), encoding="utf-8") as f:
+        withheld = {line.strip() for line in f if line.strip() and not line.startswith("#")}
+    return [f"<withheld {i}>" if hashlib.sha256(w.encode()).hexdigest() in withheld else w
+            for i, w in enumerate(vocab_words)]
+
+
 def write_files(out, model, lex, vocab_words, bpe, case_entries, lang):
     os.makedirs(out, exist_ok=True)
     write_model(os.path.join(out, "model.bin"), model, lang)
     with open(os.path.join(out, "vocab.txt"), "w", encoding="utf-8") as f:
         f.write("#kvasr-punct-vocab 1\n")
-        f.writelines(w + "\n" for w in vocab_words)
+        f.writelines(w + "\n" for w in shipped_vocab(vocab_words, lang))
     with open(os.path.join(out, "punc.txt"), "w", encoding="utf-8") as f:
         f.write("#kvasr-punct-labels 1\n")
         f.writelines(f"{n}\t{m}\t{k}\n" for n, m, k in corpus.PUNCT_LABELS)
