@@ -92,12 +92,12 @@ mkdir -p deployed
   deployed/val_speech_clean_000.tsv
 # The decision stage the decision loss is taken through is the detector's.
 PYTHONPATH=$training "$python" -c "
-import sys, numpy as np, decision
-for path in sys.argv[1:]:
-    t = np.loadtxt(path, skiprows=1, ndmin=2)
-    d = decision.decisions(t[::decision.EVAL_STRIDE_FRAMES, 1], t[:, 3])
-    assert np.array_equal(d, t[:, 4] > 0), (path, np.flatnonzero(d != (t[:, 4] > 0))[:10])
-" deployed/*.tsv
+import numpy as np, decision, frames
+for name in frames.mixture_names('mix/val'):
+    score, _, gate, speech, _ = frames.load_frame_table('deployed', name).T
+    d = decision.decisions(score[::decision.EVAL_STRIDE_FRAMES], gate)
+    assert np.array_equal(d, speech > 0), (name, np.flatnonzero(d != (speech > 0))[:10])
+"
 # The evaluation train.sh ends with reads those records.
 "$python" "$training/evaluate.py" --mix mix/val --ours deployed --json eval.json > eval.txt
 "$python" -c "import json, sys; r = json.load(open('eval.json'))['kvasr']
