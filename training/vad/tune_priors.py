@@ -3,9 +3,10 @@
 The detector calls a frame speech when its smoothed, prior-divided log
 likelihood ratio exceeds a fixed -1, so the ratio of the two priors is what
 sets the network's operating point: a frame counts as speech when
-ln(p_speech / p_other) > ln(prior_speech / prior_other) - 1. The label
-frequencies of the training frames lean far towards speech (a posterior of
-0.11 already passes). This script runs the whole detector (`kvasr vad
+ln(p_speech / p_other) > ln(prior_speech / prior_other) - 1. The priors
+train.py writes are only a starting point: the frame loss's, the label
+frequencies of the training frames, lean far towards speech (a posterior
+of 0.11 already passes). This script runs the whole detector (`kvasr vad
 --dump`, 100 ms chunks, smoothing and energy gate included) over the val
 mixtures for a range of effective thresholds and keeps the priors whose
 decisions reach the highest F1 averaged over the speech conditions; of
