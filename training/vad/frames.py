@@ -42,10 +42,10 @@ class FrameSet:
     frame count)."""
 
     def __init__(self, mix_dir, dump_dir, names):
-        rows, index, labels, owner, gate = [], [], [], [], []
+        rows, index, labels, gate = [], [], [], []
         self.spans = []
         offset = 0
-        for i, name in enumerate(names):
+        for name in names:
             x = load_rows(dump_dir, name)
             y = load_labels(mix_dir, name)
             g = load_frame_table(dump_dir, name)[:, 2]
@@ -56,13 +56,11 @@ class FrameSet:
             labels.append(y[:n])
             gate.append(g[:n].astype(np.uint8))
             index.append(splice_index(n, offset))
-            owner.append(np.full(n, i, dtype=np.int32))
             self.spans.append((name, offset, n))
             offset += n
         self.rows = np.concatenate(rows)
         self.index = np.concatenate(index)
         self.labels = np.concatenate(labels).astype(np.int64)
-        self.owner = np.concatenate(owner)
         self.gate = np.concatenate(gate)
 
     def __len__(self):

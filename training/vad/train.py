@@ -119,8 +119,11 @@ def frame_weights(frame_set, mix_dir, nospeech_weight):
     `nospeech_weight` times. The false alarms come from a few dozen music and
     noise files, which a plain mean over all frames lets the speech outvote."""
     free = set(frames.mixture_names(mix_dir, frames.NOSPEECH_KINDS))
-    ids = [i for i, name in enumerate(frames.mixture_names(mix_dir)) if name in free]
-    return np.where(np.isin(frame_set.owner, ids), nospeech_weight, 1.0)
+    weights = np.ones(len(frame_set))
+    for name, offset, count in frame_set.spans:
+        if name in free:
+            weights[offset:offset + count] = nospeech_weight
+    return weights
 
 
 def write_model(out_dir, table, net, priors):
