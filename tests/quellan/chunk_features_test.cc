@@ -14,20 +14,10 @@
 
 namespace {
 
-class RowLog : public VadFrameObserver {
- public:
-  void on_frame(const VadFrameReport& r) override {
-    frames.push_back(r.frame);
-    rows.insert(rows.end(), r.features, r.features + r.feat_dim);
-  }
-  std::vector<int> frames;
-  std::vector<float> rows;
-};
-
 // Rows of `audio` in chunks of `chunk` samples, on a pipeline that first
 // heard three seconds of another utterance and dropped it unfinished: the
 // utterance that starts over must not take over its frames.
-RowLog Rows(const std::string& dir, const std::vector<int16_t>& audio, size_t chunk) {
+quellan_test::RowLog Rows(const std::string& dir, const std::vector<int16_t>& audio, size_t chunk) {
   Cquellan pipe(quellan_test::PipelineConf(dir, false));
   const std::vector<int16_t> dropped(audio.rbegin(), audio.rbegin() + 48000);
   std::vector<int16_t> out(dropped.size() + 64000);
@@ -37,7 +27,7 @@ RowLog Rows(const std::string& dir, const std::vector<int16_t>& audio, size_t ch
                                  out.data(), static_cast<int>(out.size()), &out_len,
                                  &speech, &continued, &ended),
             0);
-  RowLog log;
+  quellan_test::RowLog log;
   pipe.set_frame_observer(&log);
   quellan_test::RunUtterance(&pipe, audio, chunk);
   testing::internal::GetCapturedStdout();
@@ -51,12 +41,12 @@ TEST(ChunkFeaturesTest, EveryChunkSizeGivesTheRowsOfOneCall) {
   if (!quellan_test::ReadFlac(path, &audio)) GTEST_SKIP() << "corpus missing: " << path;
   const std::string dir = quellan_test::MakeModelDir(10.0f);
   // Longer than one second, so the single call normalises as a stream does.
-  const RowLog whole = Rows(dir, audio, audio.size());
+  const quellan_test::RowLog whole = Rows(dir, audio, audio.size());
   ASSERT_GT(whole.frames.size(), 700u);
   // One sample, a frame shift, 20 ms, an odd length and three seconds.
   for (size_t chunk : {1, 160, 320, 1601, 48000}) {
     SCOPED_TRACE(chunk);
-    const RowLog part = Rows(dir, audio, chunk);
+    const quellan_test::RowLog part = Rows(dir, audio, chunk);
     ASSERT_EQ(part.frames, whole.frames);
     EXPECT_EQ(std::memcmp(part.rows.data(), whole.rows.data(),
                           sizeof(float) * whole.rows.size()),

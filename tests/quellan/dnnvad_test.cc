@@ -2,8 +2,9 @@
 
 #include <gtest/gtest.h>
 
-#include <algorithm>
+#include <cstdio>
 #include <memory>
+#include <stdexcept>
 #include <string>
 #include <vector>
 
@@ -14,39 +15,37 @@ namespace {
 
 constexpr int kShift = 160;
 
+using Intervals = std::vector<std::pair<int, int>>;
+
 struct CallResult {
   int ret = 0;
   int consumed = 0;
   std::vector<int> cuts;
-  std::vector<std::pair<int, int>> intervals;
+  Intervals intervals;
 };
 
 // Drives a detector with one feature column whose sign is the network's
 // decision (score +16 / -16, no smoothing, every frame evaluated), keeping
 // the feature matrix as the pipeline does. `loud` marks the frames whose
-// audio is loud; the rest is digital silence.
+// audio is loud, the rest being digital silence; without it the energy gate
+// is off.
 class DetectorHarness {
  public:
-  DetectorHarness(std::vector<bool> speech, std::vector<bool> loud,
-                  bool energy_gate)
+  explicit DetectorHarness(std::vector<bool> speech, const std::vector<bool>& loud = {})
       : speech_(std::move(speech)) {
     const std::string dir = quellan_test::MakeTempDir();
-    quellan_test::WriteNetwork(dir + "/quellan_data_b",
-                               quellan_test::SignNetwork(1, 5, 5, 0));
+    quellan_test::WriteNetwork(dir + "/quellan_data_b", quellan_test::SignNetwork(1, 5, 5, 0));
     quellan_test::WritePriors(dir + "/quellan_data_c", {1.0f, 1.0f});
     load_vad_dnn_conf(dir.c_str(), 1000, &conf_);
     conf_.feat_dim = 1;
     conf_.skip = 0;
-    conf_.score_smooth = 0.0f;
-    conf_.energy_gate = energy_gate ? 1 : 0;
-    conf_.energy_smooth = 0.0f;
+    conf_.score_smooth = conf_.energy_smooth = 0.0f;
+    conf_.energy_gate = loud.empty() ? 0 : 1;
     // Audio runs 240 samples ahead of the frames: a 400-sample window
-    // starts every 160 samples.
-    for (bool l : loud) audio_.insert(audio_.end(), kShift, l ? 8000 : 0);
+    // starts every 160 samples. Without the gate its level does not matter.
+    for (bool l : loud.empty() ? speech_ : loud) audio_.insert(audio_.end(), kShift, l ? 8000 : 0);
     audio_.insert(audio_.end(), 240, 0);
   }
-  explicit DetectorHarness(std::vector<bool> speech)
-      : DetectorHarness(speech, speech, false) {}
 
   VadDnnConf& conf() { return conf_; }
   void Build() { vad_ = std::make_unique<Cdnnvad>(conf_); }
@@ -56,19 +55,17 @@ class DetectorHarness {
     if (!vad_) Build();
     for (int i = 0; i < frames; ++i, ++fed_) feat_.push_back(speech_[fed_] ? 1.0f : -1.0f);
     ++calls_;
-    const size_t audio_end =
-        last ? audio_.size() : static_cast<size_t>(fed_) * kShift + 240;
-    const int16_t idle = 0;
-    const int16_t* samples = audio_end > sent_ ? audio_.data() + sent_ : &idle;
+    const size_t audio_end = last ? audio_.size() : static_cast<size_t>(fed_) * kShift + 240;
+    const int16_t* samples = audio_.data() + sent_;
     const int len = static_cast<int>(audio_end - sent_);
     sent_ = audio_end;
     CallResult r;
     const VadOutputLists lists{&cut_num_, cut_frame_, &seg_num_, seg_beg_, seg_end_, 5};
-    r.ret = vad_->add_wave_data(last ? -calls_ : calls_, samples, len, feat_.data(), 1,
-                                static_cast<int>(feat_.size()),
-                                static_cast<int>(feat_.size()), &r.consumed, lists);
+    const int rows = static_cast<int>(feat_.size());
+    r.ret = vad_->add_wave_data(last ? -calls_ : calls_, samples, len, feat_.data(), 1, rows,
+                                rows, &r.consumed, lists);
     if (r.ret >= 0) feat_.erase(feat_.begin(), feat_.begin() + r.consumed);
-    for (int i = 0; i < cut_num_; ++i) r.cuts.push_back(cut_frame_[i]);
+    r.cuts.assign(cut_frame_, cut_frame_ + cut_num_);
     for (int i = 0; i < seg_num_; ++i) r.intervals.emplace_back(seg_beg_[i], seg_end_[i]);
     return r;
   }
@@ -92,7 +89,7 @@ class DetectorHarness {
   int seg_end_[5] = {};
 };
 
-std::vector<bool> Pattern(int frames, const std::vector<std::pair<int, int>>& speech) {
+std::vector<bool> Pattern(int frames, const Intervals& speech) {
   std::vector<bool> v(frames, false);
   for (const auto& [begin, end] : speech) {
     for (int f = begin; f < end; ++f) v[f] = true;
@@ -100,69 +97,62 @@ std::vector<bool> Pattern(int frames, const std::vector<std::pair<int, int>>& sp
   return v;
 }
 
-using Intervals = std::vector<std::pair<int, int>>;
-
-TEST(DetectorTest, SegmentRunsFromMarginToMiddleOfClosingSilence) {
-  DetectorHarness h(Pattern(300, {{100, 200}}));
-  const CallResult r = h.FeedAll();
-  ASSERT_EQ(r.ret, 295);
-  EXPECT_EQ(r.consumed, 295) << "the last five frames stay as left context";
-  // Interval ends at its first non-speech frame, 200; 99 trailing frames.
-  EXPECT_EQ(r.intervals, (Intervals{{85, 200 + 99 / 2}}));
-  EXPECT_EQ(r.cuts, (std::vector<int>{249}));
-}
-
-TEST(DetectorTest, HeadMarginStopsAtFrameZero) {
-  DetectorHarness h(Pattern(100, {{5, 40}}));
-  const CallResult r = h.FeedAll();
-  ASSERT_EQ(r.intervals.size(), 1u);
-  EXPECT_EQ(r.intervals[0].first, 0);
-}
-
-TEST(DetectorTest, GapInsideOneBatchClosesAtTwentyNineFrames) {
-  for (int gap : {28, 29}) {
-    DetectorHarness h(Pattern(300, {{50, 100}, {100 + gap, 180}}));
+// Whole utterances in one call. A segment starts a 15-frame margin before
+// its speech and is cut in the middle of the closing silence; the interval
+// of a segment still open ends at its first non-speech frame.
+TEST(DetectorTest, SegmentsOfOneCall) {
+  struct Case {
+    const char* name;
+    std::vector<bool> speech;
+    std::vector<bool> loud;
+    Intervals intervals;
+    std::vector<int> cuts;
+  };
+  const Case cases[] = {
+      {"margin to middle of closing silence", Pattern(300, {{100, 200}}), {},
+       {{85, 200 + 99 / 2}}, {249}},
+      {"margin stops at frame zero", Pattern(100, {{5, 40}}), {}, {{0, 40 + 59 / 2}}, {69}},
+      // A gap inside one batch closes at 29 frames, one sooner than across
+      // calls: established behaviour, kept on purpose.
+      {"gap of 28 frames", Pattern(300, {{50, 100}, {128, 180}}), {}, {{35, 180 + 119 / 2}},
+       {239}},
+      {"gap of 29 frames", Pattern(300, {{50, 100}, {129, 180}}), {},
+       {{35, 114}, {114, 180 + 119 / 2}}, {114, 239}},
+      // Loud audio in frames 100..199 reaches the windows of frames 98..199.
+      {"energy gate vetoes quiet frames", std::vector<bool>(300, true),
+       Pattern(300, {{100, 200}}), {{83, 200 + 99 / 2}}, {249}},
+  };
+  for (const Case& c : cases) {
+    SCOPED_TRACE(c.name);
+    DetectorHarness h(c.speech, c.loud);
     const CallResult r = h.FeedAll();
-    if (gap == 29) {
-      // Cut in the middle of the gap; the next segment starts a margin
-      // before its speech.
-      EXPECT_EQ(r.intervals, (Intervals{{35, 114}, {114, 180 + 119 / 2}}));
-      EXPECT_EQ(r.cuts, (std::vector<int>{114, 239}));
-    } else {
-      EXPECT_EQ(r.intervals, (Intervals{{35, 180 + 119 / 2}})) << gap;
-      EXPECT_EQ(r.cuts, (std::vector<int>{239}));
-    }
+    const int frames = static_cast<int>(c.speech.size());
+    EXPECT_EQ(r.ret, frames - 5);
+    EXPECT_EQ(r.consumed, frames - 5) << "the last five frames stay as left context";
+    EXPECT_EQ(r.intervals, c.intervals);
+    EXPECT_EQ(r.cuts, c.cuts);
   }
 }
 
 TEST(DetectorTest, GapAcrossCallsNeedsThirtyOneFrames) {
   for (int gap : {29, 30, 31}) {
+    SCOPED_TRACE(gap);
     DetectorHarness h(Pattern(200, {{20, 60}, {60 + gap, 120}}));
     // Batch 0..69: speech 20..59, then ten silent frames.
-    CallResult first = h.Feed(75, false);
+    const CallResult first = h.Feed(75, false);
     ASSERT_EQ(first.consumed, 65);
     EXPECT_EQ(first.intervals, (Intervals{{5, 60}}));
     EXPECT_TRUE(first.cuts.empty());
-    CallResult second = h.Feed(125, true);
+    const CallResult second = h.Feed(125, true);
     if (gap < 31) {
-      EXPECT_EQ(second.intervals, (Intervals{{61, 120 + 79 / 2}})) << gap;
-      EXPECT_EQ(second.cuts, (std::vector<int>{159})) << gap;
+      EXPECT_EQ(second.intervals, (Intervals{{61, 120 + 79 / 2}}));
+      EXPECT_EQ(second.cuts, (std::vector<int>{159}));
     } else {
       // Carried 9 + lead 21 = 30 frames close the segment at 70 + (22 - 9) / 2.
       EXPECT_EQ(second.intervals, (Intervals{{61, 76}, {76, 159}}));
       EXPECT_EQ(second.cuts, (std::vector<int>{76, 159}));
     }
   }
-}
-
-TEST(DetectorTest, CallWithoutNewFrameLeavesListsAlone) {
-  DetectorHarness h(Pattern(200, {{20, 150}}));
-  const CallResult first = h.Feed(40, false);
-  ASSERT_EQ(first.intervals, (Intervals{{5, 34}}));
-  const CallResult idle = h.Feed(0, false);
-  EXPECT_EQ(idle.ret, 0);
-  EXPECT_EQ(idle.consumed, 0);
-  EXPECT_EQ(idle.intervals, first.intervals);
 }
 
 TEST(DetectorTest, ShortBatchesWithoutDueEvaluationCarryTheScore) {
@@ -176,14 +166,13 @@ TEST(DetectorTest, ShortBatchesWithoutDueEvaluationCarryTheScore) {
   for (int i = 0; i < 30; ++i) {
     r = h.Feed(1, false);
     ASSERT_EQ(r.ret, 1) << i;
-    ASSERT_EQ(r.intervals.size(), 1u);
-    EXPECT_EQ(r.intervals[0], std::make_pair(end + 1, end + 1));
+    ASSERT_EQ(r.intervals, (Intervals{{end + 1, end + 1}})) << i;
     end = r.intervals[0].second;
   }
 }
 
 TEST(DetectorTest, MoreIntervalsThanSlotsKeepsTheLatest) {
-  std::vector<std::pair<int, int>> bursts;
+  Intervals bursts;
   for (int i = 0; i < 8; ++i) bursts.emplace_back(50 + 60 * i, 70 + 60 * i);
   DetectorHarness h(Pattern(600, bursts));
   testing::internal::CaptureStdout();
@@ -191,43 +180,16 @@ TEST(DetectorTest, MoreIntervalsThanSlotsKeepsTheLatest) {
   const std::string out = testing::internal::GetCapturedStdout();
   // Eight segments: the first five cuts and the last five intervals stay.
   EXPECT_EQ(r.cuts, (std::vector<int>{89, 149, 209, 269, 329}));
-  EXPECT_EQ(r.intervals, (Intervals{{215, 269}, {275, 329}, {335, 389},
-                                    {395, 449}, {455, 544}}));
+  EXPECT_EQ(r.intervals,
+            (Intervals{{215, 269}, {275, 329}, {335, 389}, {395, 449}, {455, 544}}));
   EXPECT_NE(out.find("Too many intervals in one call"), std::string::npos);
   EXPECT_NE(out.find("Too many cut frames in one call"), std::string::npos);
 }
 
-TEST(DetectorTest, EnergyGateVetoesQuietFrames) {
-  // The network calls every frame speech; loud audio in frames 100..199
-  // reaches the windows of frames 98..199.
-  DetectorHarness h(std::vector<bool>(300, true), Pattern(300, {{100, 200}}), true);
-  const CallResult r = h.FeedAll();
-  EXPECT_EQ(r.intervals, (Intervals{{83, 200 + 99 / 2}}));
-}
-
-TEST(DetectorTest, RefusalsAndOverflow) {
-  DetectorHarness big(Pattern(50, {}), Pattern(50, {}), true);
-  big.conf().max_frames = 20;
-  testing::internal::CaptureStdout();
-  EXPECT_EQ(big.Feed(21, false).ret, -1);
-  EXPECT_NE(testing::internal::GetCapturedStdout().find(
-                "<<add_wave_data>>] Invalide input arguments to "
-                "Cdnnvad::AddWaveData\n"),
-            std::string::npos);
-
-  DetectorHarness full(Pattern(50, {}), Pattern(50, {}), true);
-  full.conf().max_frames = 20;
-  testing::internal::CaptureStdout();
-  EXPECT_EQ(full.Feed(19, false).ret, -1);
-  EXPECT_NE(testing::internal::GetCapturedStdout().find(
-                "Wav overflows [3280] >= [3200]\n"),
-            std::string::npos);
-}
-
+// Features for 20 frames but audio for fewer: the energy pass ends early
+// with a message and the call still succeeds.
 TEST(DetectorTest, LastChunkStopsEnergyPassAtMissingAudio) {
-  // Features for 20 frames but audio for fewer: the pass ends early with a
-  // message and the call still succeeds.
-  DetectorHarness h(Pattern(20, {{0, 20}}), Pattern(10, {{0, 10}}), true);
+  DetectorHarness h(Pattern(20, {{0, 20}}), Pattern(10, {{0, 10}}));
   testing::internal::CaptureStdout();
   const CallResult r = h.FeedAll();
   const std::string out = testing::internal::GetCapturedStdout();
@@ -238,29 +200,37 @@ TEST(DetectorTest, LastChunkStopsEnergyPassAtMissingAudio) {
       << out;
 }
 
-TEST(DetectorTest, ConstructionFailuresThrow) {
-  DetectorHarness h(Pattern(10, {}));
-  std::snprintf(h.conf().dnn_file, kVadPathBytes, "/nonexistent/net");
-  testing::internal::CaptureStdout();
-  EXPECT_THROW(h.Build(), std::runtime_error);
-  EXPECT_NE(testing::internal::GetCapturedStdout().find(
-                "<<Cdnnvad>>] Failed to load vad dnn file[/nonexistent/net].\n"),
-            std::string::npos);
-
-  DetectorHarness wrong(Pattern(10, {}));
-  wrong.conf().end_offset = 4;
-  testing::internal::CaptureStdout();
-  EXPECT_THROW(wrong.Build(), std::runtime_error);
-  EXPECT_NE(testing::internal::GetCapturedStdout().find("Failed to set_dnn_params\n"),
-            std::string::npos);
-
-  DetectorHarness priors(Pattern(10, {}));
-  std::snprintf(priors.conf().state_weights_file, kVadPathBytes, "/nonexistent/p");
-  testing::internal::CaptureStdout();
-  EXPECT_THROW(priors.Build(), std::runtime_error);
-  EXPECT_NE(testing::internal::GetCapturedStdout().find(
-                "Failed to load state-weights file[/nonexistent/p].\n"),
-            std::string::npos);
+// Construction throws and calls return -1, each with its message.
+TEST(DetectorTest, FailuresNameTheirCause) {
+  struct Case {
+    void (*change)(VadDnnConf*);
+    int frames;  // fed in one call; 0: construction fails
+    std::string message;
+  };
+  const Case cases[] = {
+      {[](VadDnnConf* c) { std::snprintf(c->dnn_file, kVadPathBytes, "/nonexistent/net"); },
+       0, "<<Cdnnvad>>] Failed to load vad dnn file[/nonexistent/net].\n"},
+      {[](VadDnnConf* c) { c->end_offset = 4; }, 0, "Failed to set_dnn_params\n"},
+      {[](VadDnnConf* c) {
+         std::snprintf(c->state_weights_file, kVadPathBytes, "/nonexistent/p");
+       },
+       0, "Failed to load state-weights file[/nonexistent/p].\n"},
+      {[](VadDnnConf* c) { c->max_frames = 20; }, 21,
+       "<<add_wave_data>>] Invalide input arguments to Cdnnvad::AddWaveData\n"},
+      {[](VadDnnConf* c) { c->max_frames = 20; }, 19, "Wav overflows [3280] >= [3200]\n"},
+  };
+  for (const Case& c : cases) {
+    SCOPED_TRACE(c.message);
+    DetectorHarness h(Pattern(50, {}), Pattern(50, {}));
+    c.change(&h.conf());
+    testing::internal::CaptureStdout();
+    if (c.frames == 0) {
+      EXPECT_THROW(h.Build(), std::runtime_error);
+    } else {
+      EXPECT_EQ(h.Feed(c.frames, false).ret, -1);
+    }
+    EXPECT_NE(testing::internal::GetCapturedStdout().find(c.message), std::string::npos);
+  }
 }
 
 }  // namespace

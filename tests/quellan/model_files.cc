@@ -13,14 +13,9 @@ namespace quellan_test {
 
 namespace {
 
-void Append(std::string* bytes, const void* data, size_t size) {
-  bytes->append(static_cast<const char*>(data), size);
-}
-
-void AppendInt(std::string* bytes, int32_t v) { Append(bytes, &v, sizeof(v)); }
-
-void AppendFloats(std::string* bytes, const std::vector<float>& v) {
-  Append(bytes, v.data(), v.size() * sizeof(float));
+template <typename T>
+void Append(std::string* bytes, const std::vector<T>& v) {
+  bytes->append(reinterpret_cast<const char*>(v.data()), v.size() * sizeof(T));
 }
 
 }  // namespace
@@ -36,33 +31,31 @@ std::string ReadBytes(const std::string& path) {
   return std::string(std::istreambuf_iterator<char>(f), {});
 }
 
-void WriteNetwork(const std::string& path, const Network& net,
-                  const std::string& flag) {
+void WriteNetwork(const std::string& path, const Network& net, const std::string& flag) {
   std::string bytes = flag;
-  AppendInt(&bytes, net.input_length);
-  AppendInt(&bytes, net.output_length);
-  AppendInt(&bytes, static_cast<int32_t>(net.hidden.size()));
-  for (int h : net.hidden) AppendInt(&bytes, h);
+  Append<int32_t>(&bytes, {net.input_length, net.output_length,
+                           static_cast<int32_t>(net.hidden.size())});
+  Append<int32_t>(&bytes, {net.hidden.begin(), net.hidden.end()});
   for (const Layer& layer : net.layers) {
-    AppendFloats(&bytes, layer.bias);
-    AppendFloats(&bytes, layer.weights);
+    Append(&bytes, layer.bias);
+    Append(&bytes, layer.weights);
   }
   WriteBytes(path, bytes);
 }
 
 void WritePriors(const std::string& path, const std::vector<float>& priors) {
   std::string bytes;
-  AppendInt(&bytes, static_cast<int32_t>(priors.size()));
-  AppendFloats(&bytes, priors);
+  Append<int32_t>(&bytes, {static_cast<int32_t>(priors.size())});
+  Append(&bytes, priors);
   WriteBytes(path, bytes);
 }
 
 void WriteMeanTable(const std::string& path, const std::vector<float>& means,
                     const std::vector<float>& variances) {
   std::string bytes;
-  AppendInt(&bytes, static_cast<int32_t>(means.size()));
-  AppendFloats(&bytes, means);
-  AppendFloats(&bytes, variances);
+  Append<int32_t>(&bytes, {static_cast<int32_t>(means.size())});
+  Append(&bytes, means);
+  Append(&bytes, variances);
   WriteBytes(path, bytes);
 }
 
@@ -71,13 +64,7 @@ Network ConstantNetwork(int input_length, float score) {
   net.input_length = input_length;
   net.output_length = 2;
   net.hidden = {1};
-  Layer hidden;
-  hidden.bias = {0.0f};
-  hidden.weights.assign(input_length, 0.0f);
-  Layer out;
-  out.bias = {0.0f, score};
-  out.weights = {0.0f, 0.0f};
-  net.layers = {hidden, out};
+  net.layers = {{{0.0f}, std::vector<float>(input_length, 0.0f)}, {{0.0f, score}, {0.0f, 0.0f}}};
   return net;
 }
 
@@ -100,9 +87,9 @@ std::string MakeTempDir() {
   return pattern;
 }
 
-std::string MakeModelDir(float score) {
+std::string MakeModelDir(float score, int row_width) {
   const std::string dir = MakeTempDir();
-  WriteNetwork(dir + "/quellan_data_b", ConstantNetwork(39 * 11, score));
+  WriteNetwork(dir + "/quellan_data_b", ConstantNetwork(row_width * 11, score));
   WritePriors(dir + "/quellan_data_c", {1.0f, 1.0f});
   WriteMeanTable(dir + "/quellan_data_a", std::vector<float>(39, 0.0f),
                  std::vector<float>(39, 1.0f));

@@ -40,9 +40,10 @@ Network ConstantNetwork(int input_length, float score);
 // A fresh empty directory under the test's temporary folder.
 std::string MakeTempDir();
 
-// A model directory holding a constant-score network, priors of 1 and a mean
-// table of zero means and unit variances.
-std::string MakeModelDir(float score);
+// A model directory holding a constant-score network over eleven rows of
+// `row_width` values, priors of 1 and a mean table of zero means and unit
+// variances.
+std::string MakeModelDir(float score, int row_width = 39);
 
 // Audio of the shared corpus; tests skip when it is absent.
 std::string CorpusPath(const std::string& relative);

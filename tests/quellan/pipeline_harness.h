@@ -6,6 +6,7 @@
 #include <gtest/gtest.h>
 
 #include <cstdint>
+#include <set>
 #include <string>
 #include <utility>
 #include <vector>
@@ -21,6 +22,16 @@ struct Emission {
   int continued = 0;
   int ended = 0;
   std::vector<std::pair<int, int>> intervals;  // frames of every interval
+};
+
+// Records every row the detector sees, frame-major.
+struct RowLog : VadFrameObserver {
+  void on_frame(const VadFrameReport& r) override {
+    frames.push_back(r.frame);
+    rows.insert(rows.end(), r.features, r.features + r.feat_dim);
+  }
+  std::vector<int> frames;
+  std::vector<float> rows;
 };
 
 // Settings with the given model directory; `exact` switches off score and
@@ -81,6 +92,24 @@ inline std::vector<Emission> RunUtterance(Cquellan* pipe,
     calls.push_back(std::move(e));
   }
   return calls;
+}
+
+// Frames of the emitted intervals; `closed` counts the segments ended. A
+// call that completes no frame repeats the previous call's report and is
+// skipped.
+inline std::set<int> EmittedFrames(const std::vector<Emission>& calls, int* closed) {
+  std::set<int> frames;
+  *closed = 0;
+  const std::vector<std::pair<int, int>>* previous = nullptr;
+  for (const Emission& e : calls) {
+    if (previous != nullptr && e.intervals == *previous) continue;
+    previous = &e.intervals;
+    for (const auto& [begin, end] : e.intervals) {
+      for (int f = begin; f <= end; ++f) frames.insert(f);
+    }
+    *closed += e.ended;
+  }
+  return frames;
 }
 
 }  // namespace quellan_test

@@ -2,8 +2,8 @@
 
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <cmath>
-#include <map>
 #include <memory>
 #include <string>
 #include <vector>
@@ -17,13 +17,6 @@ namespace {
 constexpr int kRate = 16000;
 constexpr int kToneDim = 3;
 constexpr float kSentinel = -777.0f;
-
-PitchConf Conf() {
-  PitchConf conf{};
-  EXPECT_EQ(load_pitch_conf(nullptr, &conf), 0);
-  EXPECT_EQ(conf.tone_dim, kToneDim);
-  return conf;
-}
 
 // Faint noise with a rising harmonic complex from 0.3 s to 1.3 s.
 std::vector<int16_t> GlideAudio(int seconds) {
@@ -51,23 +44,25 @@ struct ToneRun {
 
 // Feeds `audio` in chunks of the given sizes (cycled), then ends the stream.
 ToneRun RunTone(const std::vector<int16_t>& audio, const std::vector<int>& chunks) {
-  auto tone = std::make_unique<Vortaf0Interface>(Conf(), 0);
+  PitchConf conf{};
+  EXPECT_EQ(load_pitch_conf(nullptr, &conf), 0);
+  EXPECT_EQ(conf.tone_dim, kToneDim);
+  auto tone = std::make_unique<Vortaf0Interface>(conf, 0);
   tone->SetToneFeatureOffset(0);
   ToneRun run;
   const int capacity = static_cast<int>(audio.size()) / 160 + 1;
   run.features.assign(static_cast<size_t>(capacity) * kToneDim, kSentinel);
   run.raw.resize(static_cast<size_t>(capacity));
-  size_t pos = 0;
   int raw_total = 0;
-  for (size_t c = 0; pos < audio.size(); ++c) {
-    const int len = std::min<int>(chunks[c % chunks.size()],
-                                  static_cast<int>(audio.size() - pos));
+  for (size_t c = 0, pos = 0; pos < audio.size(); ++c) {
+    const int len = std::min<int>(chunks[c % chunks.size()], static_cast<int>(audio.size() - pos));
     int written = -1;
     int raw_count = -1;
-    EXPECT_EQ(tone->ExtractToneFeature(
-                  audio.data() + pos, len, run.features.data() + run.frames * kToneDim,
-                  capacity - run.frames, &written, run.raw.data() + raw_total,
-                  capacity - raw_total, &raw_count),
+    EXPECT_EQ(tone->ExtractToneFeature(audio.data() + pos, len,
+                                       run.features.data() + run.frames * kToneDim,
+                                       capacity - run.frames, &written,
+                                       run.raw.data() + raw_total, capacity - raw_total,
+                                       &raw_count),
               0);
     run.frames += written;
     raw_total += raw_count;
@@ -91,40 +86,27 @@ TEST(ToneInterfaceFraming, AnyChunkingMatchesWholeFrames) {
   const ToneRun whole = RunTone(audio, {160});
   ASSERT_GT(whole.frames, 150);
   ASSERT_GT(whole.raw.size(), 150u);
-  const std::vector<std::vector<int>> cuts = {
-      {159, 1}, {100, 400}, {1}, {0, 320, 7}, {4000}, {161, 159, 3}};
-  for (const auto& cut : cuts) {
+  const std::vector<std::vector<int>> cuts = {{159, 1},     {100, 400}, {1},
+                                               {0, 320, 7}, {4000},     {161, 159, 3}};
+  for (const std::vector<int>& cut : cuts) {
+    SCOPED_TRACE(cut[0]);
     const ToneRun run = RunTone(audio, cut);
-    EXPECT_EQ(run.frames, whole.frames) << cut[0];
-    EXPECT_EQ(run.features, whole.features) << cut[0];
-    EXPECT_EQ(run.raw, whole.raw) << cut[0];
+    EXPECT_EQ(run.frames, whole.frames);
+    EXPECT_EQ(run.features, whole.features);
+    EXPECT_EQ(run.raw, whole.raw);
   }
 }
 
-// Records the row the detector sees for every frame.
-class RowRecorder : public VadFrameObserver {
- public:
-  void on_frame(const VadFrameReport& report) override {
-    rows[report.frame].assign(report.features, report.features + report.feat_dim);
-  }
-  std::map<int, std::vector<float>> rows;
-};
-
 TEST(ToneInterfacePipeline, ToneColumnsFollowThePlpColumns) {
-  const std::string plain_dir = quellan_test::MakeModelDir(10.0f);
-  const std::string tone_dir = quellan_test::MakeTempDir();
-  const int row = 39 + kToneDim;
-  quellan_test::WriteNetwork(tone_dir + "/quellan_data_b",
-                             quellan_test::ConstantNetwork(row * 11, 10.0f));
-  quellan_test::WritePriors(tone_dir + "/quellan_data_c", {1.0f, 1.0f});
-  quellan_test::WriteMeanTable(tone_dir + "/quellan_data_a", std::vector<float>(39, 0.0f),
-                               std::vector<float>(39, 1.0f));
+  constexpr int kPlpDim = 39;
+  constexpr int kRow = kPlpDim + kToneDim;
+  const std::string tone_dir = quellan_test::MakeModelDir(10.0f, kRow);
   QuellanConf tone_conf = quellan_test::PipelineConf(tone_dir, false);
   tone_conf.use_pitch = 1;
   ASSERT_EQ(load_pitch_conf(tone_dir.c_str(), &tone_conf.pitch), 0);
   Cquellan with_tone(tone_conf);
-  Cquellan plain(quellan_test::PipelineConf(plain_dir, false));
-  RowRecorder tone_rows, plain_rows;
+  Cquellan plain(quellan_test::PipelineConf(quellan_test::MakeModelDir(10.0f), false));
+  quellan_test::RowLog tone_rows, plain_rows;
   with_tone.set_frame_observer(&tone_rows);
   plain.set_frame_observer(&plain_rows);
 
@@ -138,19 +120,16 @@ TEST(ToneInterfacePipeline, ToneColumnsFollowThePlpColumns) {
   EXPECT_EQ(testing::internal::GetCapturedStdout().find("WARNING"), std::string::npos);
 
   const ToneRun reference = RunTone(audio, {1600});
-  ASSERT_EQ(tone_rows.rows.size(), plain_rows.rows.size());
-  ASSERT_EQ(static_cast<int>(tone_rows.rows.size()), reference.frames + 1);
-  for (const auto& [frame, values] : tone_rows.rows) {
-    ASSERT_EQ(values.size(), static_cast<size_t>(row));
-    const std::vector<float>& plp = plain_rows.rows.at(frame);
-    ASSERT_EQ(plp.size(), 39u);
-    EXPECT_TRUE(std::equal(plp.begin(), plp.end(), values.begin())) << frame;
-    // The tone track is padded to the PLP length with its last frame.
-    const int source = std::min(frame, reference.frames - 1);
-    for (int d = 0; d < kToneDim; ++d) {
-      EXPECT_EQ(values[39 + d], reference.features[static_cast<size_t>(source) * kToneDim + d])
-          << frame << "," << d;
-    }
+  ASSERT_EQ(tone_rows.frames, plain_rows.frames);
+  ASSERT_EQ(static_cast<int>(tone_rows.frames.size()), reference.frames + 1);
+  ASSERT_EQ(tone_rows.rows.size(), tone_rows.frames.size() * kRow);
+  for (size_t i = 0; i < tone_rows.frames.size(); ++i) {
+    SCOPED_TRACE(tone_rows.frames[i]);
+    const float* row = tone_rows.rows.data() + i * kRow;
+    EXPECT_TRUE(std::equal(row, row + kPlpDim, plain_rows.rows.begin() + i * kPlpDim));
+    const size_t source = std::min<size_t>(i, reference.frames - 1);
+    EXPECT_TRUE(std::equal(row + kPlpDim, row + kRow,
+                           reference.features.begin() + source * kToneDim));
   }
 }
 
