@@ -1,12 +1,11 @@
 #include "decoder_double.h"
 
+#include <algorithm>
 #include <deque>
 #include <map>
 #include <memory>
 
 #include "kvasr_decoder_api.h"
-
-#define DOUBLE_API extern "C"
 
 namespace decoder_double {
 namespace {
@@ -42,6 +41,12 @@ Call& Record(const std::string& name, std::vector<int64_t> args = {}) {
   return world().calls.back();
 }
 
+// For the calls that only configure: recorded, and always accepted.
+int Accept(const std::string& name, std::vector<int64_t> args = {}) {
+  Record(name, std::move(args));
+  return 0;
+}
+
 void Fire(void* handle, std::deque<std::vector<Event>>& queue) {
   if (queue.empty()) return;
   std::vector<Event> batch = std::move(queue.front());
@@ -59,19 +64,8 @@ void Fire(void* handle, std::deque<std::vector<Event>>& queue) {
 
 }  // namespace
 
-void Reset() {
-  World& w = world();
-  w.calls.clear();
-  w.decoders.clear();
-  w.init_fails = false;
-  w.start_result = 0;
-  w.set_data_results.clear();
-  w.on_set_data.clear();
-  w.on_stop.clear();
-}
-
+void Reset() { world() = World(); }
 void ClearCalls() { world().calls.clear(); }
-
 const std::vector<Call>& Calls() { return world().calls; }
 
 std::vector<std::string> CallNames() {
@@ -81,9 +75,8 @@ std::vector<std::string> CallNames() {
 }
 
 int Count(const std::string& name) {
-  int n = 0;
-  for (const Call& c : world().calls) n += c.name == name;
-  return n;
+  const std::vector<std::string> names = CallNames();
+  return static_cast<int>(std::count(names.begin(), names.end(), name));
 }
 
 int LiveDecoders() { return static_cast<int>(world().decoders.size()); }
@@ -94,27 +87,24 @@ void QueueOnSetData(std::vector<Event> batch) { world().on_set_data.push_back(st
 void QueueOnStop(std::vector<Event> batch) { world().on_stop.push_back(std::move(batch)); }
 
 Event Result(const std::string& text, int flag, float score) {
-  Event e;
-  e.text = text;
-  e.flag = flag;
-  e.score = score;
-  return e;
+  return Event{Event::kResult, text, false, score, flag};
 }
 
-Event SpeechEnd() {
-  Event e;
-  e.kind = Event::kSpeechEnd;
-  return e;
-}
+Event SpeechEnd() { return Event{Event::kSpeechEnd, "", false, 0.0f, 0}; }
+
 }  // namespace decoder_double
 
 using namespace decoder_double;
 
-DOUBLE_API void* mwDecoderInit(FILE* model_file, int reserved, int lang_flag) {
+extern "C" {
+
+void* mwDecoderInit(FILE* model_file, int reserved, int lang_flag) {
   Call& call = Record("mwDecoderInit", {reserved, lang_flag});
   char buffer[256];
   size_t n;
-  while (model_file && (n = fread(buffer, 1, sizeof buffer, model_file)) > 0) call.model.append(buffer, n);
+  while (model_file && (n = fread(buffer, 1, sizeof buffer, model_file)) > 0) {
+    call.model.append(buffer, n);
+  }
   if (world().init_fails) return nullptr;
   auto decoder = std::make_unique<Decoder>();
   void* handle = decoder.get();
@@ -122,50 +112,39 @@ DOUBLE_API void* mwDecoderInit(FILE* model_file, int reserved, int lang_flag) {
   return handle;
 }
 
-DOUBLE_API void mwDecoderDestroy(void* decoder) {
+void mwDecoderDestroy(void* decoder) {
   Record("mwDecoderDestroy");
   world().decoders.erase(decoder);
 }
 
-DOUBLE_API int mwSetVadEnabled(void*, int enabled) {
-  Record("mwSetVadEnabled", {enabled});
-  return 0;
+int mwSetVadEnabled(void*, int enabled) { return Accept("mwSetVadEnabled", {enabled}); }
+int mwSetAutoStopEnabled(void*, int enabled) { return Accept("mwSetAutoStopEnabled", {enabled}); }
+
+int mwSetVadThreshold(void*, int32_t first, int32_t second) {
+  return Accept("mwSetVadThreshold", {first, second});
 }
 
-DOUBLE_API int mwSetAutoStopEnabled(void*, int enabled) {
-  Record("mwSetAutoStopEnabled", {enabled});
-  return 0;
-}
-
-DOUBLE_API int mwSetVadThreshold(void*, int32_t first, int32_t second) {
-  Record("mwSetVadThreshold", {first, second});
-  return 0;
-}
-
-DOUBLE_API int mwSetOutHandle(void* decoder, void* out_handle) {
-  Record("mwSetOutHandle");
+int mwSetOutHandle(void* decoder, void* out_handle) {
   if (Decoder* d = Find(decoder)) d->out_handle = out_handle;
-  return 0;
+  return Accept("mwSetOutHandle");
 }
 
-DOUBLE_API int mwSetOnSpeechEnd(void* decoder, mw_speech_end_callback callback) {
-  Record("mwSetOnSpeechEnd");
+int mwSetOnSpeechEnd(void* decoder, mw_speech_end_callback callback) {
   if (Decoder* d = Find(decoder)) d->on_speech_end = callback;
-  return 0;
+  return Accept("mwSetOnSpeechEnd");
 }
 
-DOUBLE_API int mwSetOnResult(void* decoder, mw_result_callback callback) {
-  Record("mwSetOnResult");
+int mwSetOnResult(void* decoder, mw_result_callback callback) {
   if (Decoder* d = Find(decoder)) d->on_result = callback;
-  return 0;
+  return Accept("mwSetOnResult");
 }
 
-DOUBLE_API int mwStartDecode(void*) {
+int mwStartDecode(void*) {
   Record("mwStartDecode");
   return world().start_result;
 }
 
-DOUBLE_API int mwSetData(void* decoder, const int16_t* samples, int64_t count, int last) {
+int mwSetData(void* decoder, const int16_t* samples, int64_t count, int last) {
   Call& call = Record("mwSetData", {count, last});
   if (samples && count > 0) call.samples.assign(samples, samples + count);
   int result = 0;
@@ -177,13 +156,15 @@ DOUBLE_API int mwSetData(void* decoder, const int16_t* samples, int64_t count, i
   return result;
 }
 
-DOUBLE_API int mwStopDecode(void* decoder) {
+int mwStopDecode(void* decoder) {
   Record("mwStopDecode");
   Fire(decoder, world().on_stop);
   return 0;
 }
 
-DOUBLE_API const char* mwGetVersion(void) {
+const char* mwGetVersion(void) {
   Record("mwGetVersion");
   return "decoder-double 1.0";
 }
+
+}  // extern "C"

@@ -15,7 +15,7 @@ struct World {
   std::set<void*> handles;
   bool init_fails = false;
   std::deque<Reply> replies;
-  int next_handle = 1;
+  uintptr_t next_handle = 1;
 };
 
 World& world() {
@@ -25,10 +25,7 @@ World& world() {
 
 }  // namespace
 
-void Reset() {
-  world() = World();
-}
-
+void Reset() { world() = World(); }
 const std::vector<Call>& Calls() { return world().calls; }
 
 int Count(const std::string& name) {
@@ -48,25 +45,20 @@ extern "C" void* punctuator_init(const char* model_path, const char* vocab_path,
                                  const char* punc_path, const char* num_path,
                                  const char* case_path, const char* xdb_path,
                                  const char* bpe_path, const char* lang) {
-  Call call;
-  call.name = "punctuator_init";
-  call.strings = {model_path, vocab_path, punc_path, num_path, case_path, xdb_path, bpe_path, lang};
-  world().calls.push_back(call);
+  world().calls.push_back({"punctuator_init",
+                           {model_path, vocab_path, punc_path, num_path, case_path, xdb_path,
+                            bpe_path, lang},
+                           0});
   if (world().init_fails) return nullptr;
   // Distinct non-null tokens; never dereferenced.
-  void* handle = reinterpret_cast<void*>(static_cast<uintptr_t>(world().next_handle++) << 4);
+  void* handle = reinterpret_cast<void*>(world().next_handle++ << 4);
   world().handles.insert(handle);
   return handle;
 }
 
 extern "C" int punctuator_do_it(void* handle, const char* text, char* out, int32_t* size) {
-  Call call;
-  call.name = "punctuator_do_it";
-  call.text = text;
-  call.size_in = *size;
-  world().calls.push_back(call);
+  world().calls.push_back({"punctuator_do_it", {}, *size});
   if (!world().handles.count(handle)) return 3;
-
   Reply reply;
   if (!world().replies.empty()) {
     reply = world().replies.front();
@@ -82,8 +74,6 @@ extern "C" int punctuator_do_it(void* handle, const char* text, char* out, int32
 }
 
 extern "C" void punctuator_relese(void* handle) {
-  Call call;
-  call.name = "punctuator_relese";
-  world().calls.push_back(call);
+  world().calls.push_back({"punctuator_relese", {}, 0});
   world().handles.erase(handle);
 }

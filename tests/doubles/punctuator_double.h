@@ -13,7 +13,6 @@ namespace punctuator_double {
 struct Call {
   std::string name;
   std::vector<std::string> strings;  // punctuator_init: the eight strings
-  std::string text;                  // punctuator_do_it: input text
   int32_t size_in = 0;               // punctuator_do_it: buffer capacity given
 };
 

@@ -3,7 +3,6 @@
 #include <algorithm>
 #include <deque>
 #include <set>
-#include <stdexcept>
 
 #include "quellan_wrap.h"
 
@@ -14,9 +13,8 @@ struct World {
   std::vector<Call> calls;
   std::set<void*> handles;
   std::string null_dir = "\x01";
-  std::string throw_dir = "\x01";
   std::deque<Output> outputs;
-  int next_handle = 1;
+  uintptr_t next_handle = 1;
 };
 
 World& world() {
@@ -29,14 +27,8 @@ World& world() {
 void Reset() { world() = World(); }
 const std::vector<Call>& Calls() { return world().calls; }
 
-int Count(const std::string& name) {
-  return static_cast<int>(std::count_if(world().calls.begin(), world().calls.end(),
-                                        [&](const Call& c) { return c.name == name; }));
-}
-
 int LiveHandles() { return static_cast<int>(world().handles.size()); }
 void SetCreateReturnsNullFor(const std::string& dir) { world().null_dir = dir; }
-void SetCreateThrowsFor(const std::string& dir) { world().throw_dir = dir; }
 void QueueOutput(Output output) { world().outputs.push_back(std::move(output)); }
 
 }  // namespace quellan_double
@@ -44,13 +36,10 @@ void QueueOutput(Output output) { world().outputs.push_back(std::move(output)); 
 using namespace quellan_double;
 
 extern "C" void* quellan_create(const char* dir) {
-  Call call;
-  call.name = "quellan_create";
-  call.dir = dir ? dir : "";
-  world().calls.push_back(call);
-  if (call.dir == world().throw_dir) throw std::runtime_error("init vad failed");
-  if (call.dir == world().null_dir) return nullptr;
-  void* handle = reinterpret_cast<void*>(static_cast<uintptr_t>(world().next_handle++) << 4);
+  world().calls.push_back({"quellan_create", 0, 0, 0});
+  if (dir == world().null_dir) return nullptr;
+  // Distinct non-null tokens; never dereferenced.
+  void* handle = reinterpret_cast<void*>(world().next_handle++ << 4);
   world().handles.insert(handle);
   return handle;
 }
@@ -58,14 +47,9 @@ extern "C" void* quellan_create(const char* dir) {
 extern "C" int quellan_process_wave(void* handle, int index, const int16_t*, int len,
                                     int16_t* out, int out_capacity, int* out_len, int* speech,
                                     int* continued, int* ended) {
-  Call call;
-  call.name = "quellan_process_wave";
-  call.index = index;
-  call.len = len;
-  call.out_capacity = out_capacity;
-  world().calls.push_back(call);
+  world().calls.push_back({"quellan_process_wave", index, len, out_capacity});
   if (!world().handles.count(handle) || world().outputs.empty()) return 0;
-  Output o = world().outputs.front();
+  const Output o = std::move(world().outputs.front());
   world().outputs.pop_front();
   const int n = std::min(static_cast<int>(o.samples.size()), out_capacity);
   std::copy(o.samples.begin(), o.samples.begin() + n, out);
@@ -76,16 +60,9 @@ extern "C" int quellan_process_wave(void* handle, int index, const int16_t*, int
   return 0;
 }
 
-extern "C" void quellan_reset(void* handle) {
-  Call call;
-  call.name = "quellan_reset";
-  world().calls.push_back(call);
-  (void)handle;
-}
+extern "C" void quellan_reset(void*) { world().calls.push_back({"quellan_reset", 0, 0, 0}); }
 
 extern "C" void quellan_destroy(void* handle) {
-  Call call;
-  call.name = "quellan_destroy";
-  world().calls.push_back(call);
+  world().calls.push_back({"quellan_destroy", 0, 0, 0});
   world().handles.erase(handle);
 }

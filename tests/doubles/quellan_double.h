@@ -21,17 +21,13 @@ struct Call {
   int index = 0;
   int len = 0;
   int out_capacity = 0;
-  std::string dir;  // quellan_create only
 };
 
 void Reset();
 const std::vector<Call>& Calls();
-int Count(const std::string& name);
 int LiveHandles();
-// quellan_create returns null for this directory, or throws
-// std::runtime_error("init vad failed").
+// quellan_create returns null for this directory.
 void SetCreateReturnsNullFor(const std::string& dir);
-void SetCreateThrowsFor(const std::string& dir);
 // Outputs of the following quellan_process_wave calls; silence once exhausted.
 void QueueOutput(Output output);
 

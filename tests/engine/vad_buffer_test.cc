@@ -2,23 +2,21 @@
 
 #include <gtest/gtest.h>
 
+#include <utility>
 #include <vector>
 
 #include "quellan_double.h"
-#include "test_support.h"
 
 namespace vorta {
 namespace speech {
 namespace {
 
-using kvasr_test::Stdout;
 using quellan_double::Output;
+using Segments = std::vector<std::pair<std::vector<uint16_t>, bool>>;  // samples, finished
 
 Output Speech(std::vector<int16_t> samples, int continued, int ended) {
   return Output{std::move(samples), 1, continued, ended};
 }
-
-std::vector<uint16_t> U(std::vector<int16_t> s) { return std::vector<uint16_t>(s.begin(), s.end()); }
 
 class VadBufferTest : public testing::Test {
  protected:
@@ -31,6 +29,17 @@ class VadBufferTest : public testing::Test {
   void Feed(size_t len, bool end = false) {
     std::vector<uint16_t> chunk(len, 0);
     vad_.ProcessIn(chunk.data(), chunk.size(), end);
+  }
+
+  // Every segment on hand, up to the empty open one.
+  Segments Take() {
+    Segments out;
+    for (;;) {
+      bool finished = false;
+      std::vector<uint16_t> segment = vad_.TakeSegment(&finished);
+      if (segment.empty() && !finished) return out;
+      out.emplace_back(std::move(segment), finished);
+    }
   }
 
   std::vector<int> Indices() const {
@@ -59,91 +68,43 @@ TEST_F(VadBufferTest, CallIndexCountsNonEmptyChunksAndIsNegatedOnTheLast) {
   EXPECT_EQ(Indices().back(), 1);
 }
 
-TEST_F(VadBufferTest, OpenSegmentIsHandedOutAsItGrows) {
-  quellan_double::QueueOutput(Speech({1, 2}, 0, 0));
-  quellan_double::QueueOutput(Speech({3}, 1, 0));
-  Feed(160);
-  bool finished = false;
-  EXPECT_EQ(vad_.TakeSegment(&finished), U({1, 2}));
-  EXPECT_FALSE(finished);
-  Feed(160);
-  EXPECT_EQ(vad_.TakeSegment(&finished), U({3}));
-  EXPECT_FALSE(finished);
-  EXPECT_TRUE(vad_.TakeSegment(&finished).empty());
-}
-
-TEST_F(VadBufferTest, SegmentThatBeginsAndEndsInOneCallClosesOnlyLater) {
-  quellan_double::QueueOutput(Speech({1, 2}, 0, 1));  // opens and ends at once
-  quellan_double::QueueOutput(Speech({3}, 1, 0));     // no end: stays open
-  quellan_double::QueueOutput(Speech({4}, 1, 1));     // ends: closes
-  Feed(160);
-  Feed(160);
-  bool finished = false;
-  Feed(160);
-  EXPECT_EQ(vad_.TakeSegment(&finished), U({1, 2, 3, 4}));
-  EXPECT_TRUE(finished);
-  finished = false;
-  EXPECT_TRUE(vad_.TakeSegment(&finished).empty());
-  EXPECT_FALSE(finished);
-}
-
-TEST_F(VadBufferTest, LastChunkClosesAnOpenSegmentEvenWithoutSpeech) {
-  quellan_double::QueueOutput(Speech({5}, 0, 0));
-  Feed(160);
-  Feed(160, true);  // module reports nothing, the caller's end closes it
-  bool finished = false;
-  EXPECT_EQ(vad_.TakeSegment(&finished), U({5}));
-  EXPECT_TRUE(finished);
-}
-
-TEST_F(VadBufferTest, TwoQueuedSegmentsComeOutOneAtATime) {
-  quellan_double::QueueOutput(Speech({1}, 0, 0));
-  quellan_double::QueueOutput(Speech({2}, 1, 1));
-  quellan_double::QueueOutput(Speech({7}, 0, 0));
-  quellan_double::QueueOutput(Speech({8}, 1, 1));
-  for (int i = 0; i < 4; ++i) Feed(160);
-  bool finished = false;
-  EXPECT_EQ(vad_.TakeSegment(&finished), U({1, 2}));
-  EXPECT_TRUE(finished);
-  finished = false;
-  EXPECT_EQ(vad_.TakeSegment(&finished), U({7, 8}));
-  EXPECT_TRUE(finished);
-  finished = false;
-  EXPECT_TRUE(vad_.TakeSegment(&finished).empty());
-  EXPECT_FALSE(finished);
-}
-
-TEST_F(VadBufferTest, InitAndStartFailures) {
-  quellan_double::SetCreateThrowsFor("bad");
-  Vad throwing("bad");
-  EXPECT_EQ(Stdout([&] { EXPECT_FALSE(throwing.Init()); }), "vad init exception:init vad failed\n");
-  EXPECT_FALSE(throwing.Start());
-
-  quellan_double::SetCreateReturnsNullFor("empty");
-  Vad unconfigured("empty");
-  EXPECT_TRUE(unconfigured.Init());
-  EXPECT_FALSE(unconfigured.Start());
-}
-
-TEST_F(VadBufferTest, ReleaseDestroysTheModuleOnce) {
-  vad_.Release();
-  vad_.Release();
-  EXPECT_EQ(quellan_double::Count("quellan_destroy"), 1);
-  EXPECT_EQ(quellan_double::LiveHandles(), 0);
-  EXPECT_FALSE(vad_.Start());
+TEST_F(VadBufferTest, SegmentsCloseOnTheModulesEndOrTheCallersLastChunk) {
+  struct Case {
+    const char* what;
+    std::vector<Output> outputs;
+    std::vector<bool> ends;  // one chunk each
+    Segments expected;
+  };
+  const Case cases[] = {
+      // Kept on purpose: a segment that opens and ends within one call stays
+      // open until the next call that ends it.
+      {"begins and ends in one call",
+       {Speech({1, 2}, 0, 1), Speech({3}, 1, 0), Speech({4}, 1, 1)},
+       {false, false, false},
+       {{{1, 2, 3, 4}, true}}},
+      {"closed by the last chunk", {Speech({5}, 0, 0)}, {false, true}, {{{5}, true}}},
+      {"two queued segments",
+       {Speech({1}, 0, 0), Speech({2}, 1, 1), Speech({7}, 0, 0), Speech({8}, 1, 1)},
+       {false, false, false, false},
+       {{{1, 2}, true}, {{7, 8}, true}}},
+  };
+  for (const Case& c : cases) {
+    SCOPED_TRACE(c.what);
+    ASSERT_TRUE(vad_.Start());
+    for (const Output& o : c.outputs) quellan_double::QueueOutput(o);
+    for (bool end : c.ends) Feed(160, end);
+    EXPECT_EQ(Take(), c.expected);
+  }
 }
 
 using VadBufferDeathTest = VadBufferTest;
 
-TEST_F(VadBufferDeathTest, ProcessInAfterResetWithoutStartAborts) {
-  vad_.Reset();
-  EXPECT_DEATH(Feed(160), "!m_data.empty\\(\\)");
-}
-
-TEST_F(VadBufferDeathTest, ProcessInWithoutModuleAborts) {
+TEST_F(VadBufferDeathTest, ProcessInWithoutModuleOrStartAborts) {
   Vad never_initialised("models");
   std::vector<uint16_t> chunk(160);
   EXPECT_DEATH(never_initialised.ProcessIn(chunk.data(), chunk.size(), false), "m_vad_ptr");
+  vad_.Reset();
+  EXPECT_DEATH(Feed(160), "!m_data.empty\\(\\)");
 }
 
 }  // namespace

@@ -1,5 +1,6 @@
-// Runs a fuzz target's entry point over saved inputs, without libFuzzer, so
-// that every finding stays a test of the normal and sanitizer builds.
+// Runs a fuzz target's entry point over the saved inputs of one folder,
+// without libFuzzer, so that every finding stays a test of the normal and
+// sanitizer builds.
 #include <cstddef>
 #include <cstdint>
 #include <cstdio>
@@ -13,17 +14,12 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size);
 extern "C" __attribute__((weak)) int LLVMFuzzerInitialize(int* argc, char*** argv);
 
 int main(int argc, char** argv) {
+  if (argc != 2) return 2;
   // Gathered first: a target may change the working directory on start.
   std::vector<std::filesystem::path> inputs;
-  for (int i = 1; i < argc; ++i) {
-    const std::filesystem::path arg = std::filesystem::absolute(argv[i]);
-    if (std::filesystem::is_directory(arg)) {
-      for (const auto& entry : std::filesystem::directory_iterator(arg)) {
-        if (entry.is_regular_file()) inputs.push_back(entry.path());
-      }
-    } else {
-      inputs.push_back(arg);
-    }
+  const std::filesystem::path folder = std::filesystem::absolute(argv[1]);
+  for (const auto& entry : std::filesystem::directory_iterator(folder)) {
+    if (entry.is_regular_file()) inputs.push_back(entry.path());
   }
   if (LLVMFuzzerInitialize) LLVMFuzzerInitialize(&argc, &argv);
   for (const auto& path : inputs) {

@@ -6,7 +6,6 @@
 #include <cpprest/json.h>
 
 #include "model_files.h"
-#include "offline_asr_engine_impl.h"
 
 namespace kvasr_reliability {
 
@@ -29,31 +28,36 @@ std::vector<int16_t> QuietNoise(size_t samples, uint32_t seed) {
   return noise;
 }
 
-Transcript Listen(const std::string& model_dir, const std::string& start_params,
-                  const std::vector<int16_t>& audio, int chunk) {
-  Transcript t;
-  const std::string init = R"({"local_moxwing_model_file_path":"/dev/null",)"
-                           R"("local_vad_model_dir_path":")" + model_dir +
-                           R"(","lang":"en-US","vad_enabled":true})";
-  vorta::speech::OfflineAsrEngineImpl engine;
-  if (!engine.Init(init)) throw std::runtime_error("init failed");
-  const bool started = engine.AsrStart(start_params, nullptr, [&t](std::string message) {
+Listener::Listener(const std::string& model_dir, const std::string& start_params) {
+  if (!engine_.Init(R"({"local_moxwing_model_file_path":"/dev/null","local_vad_model_dir_path":")" +
+                    model_dir + R"(","lang":"en-US","vad_enabled":true})")) {
+    throw std::runtime_error("init failed");
+  }
+  const bool started = engine_.AsrStart(start_params, nullptr, [this](std::string message) {
     const web::json::value root = web::json::value::parse(message);
-    summing_decoder::Segment segment;
-    if (summing_decoder::ParseText(root.at(U("result")).at(U("text")).as_string(), &segment)) {
-      t.segments.push_back(segment);
+    int64_t samples = 0;
+    if (summing_decoder::ParseSamples(root.at(U("result")).at(U("text")).as_string(), &samples)) {
+      transcript_.segment_samples.push_back(samples);
     }
-    t.messages.push_back(std::move(message));
+    transcript_.messages.push_back(std::move(message));
   });
   if (!started) throw std::runtime_error("start failed");
+}
+
+int Listener::Feed(const std::vector<int16_t>& audio, int chunk) {
   const auto* data = reinterpret_cast<const uint16_t*>(audio.data());
+  int refused = 0;
   for (size_t at = 0; at < audio.size(); at += chunk) {
     const int n = static_cast<int>(std::min<size_t>(chunk, audio.size() - at));
-    if (!engine.ProcessSoundData(data + at, n, 0)) ++t.failed_calls;
+    refused += engine_.ProcessSoundData(data + at, n, 0) ? 0 : 1;
   }
-  engine.Stop();
-  engine.Close();
-  return t;
+  return refused;
+}
+
+Transcript Listener::Finish() {
+  engine_.Stop();
+  engine_.Close();
+  return transcript_;
 }
 
 }  // namespace kvasr_reliability

@@ -1,6 +1,5 @@
-// Runs whole listening periods of the engine with the voice activity module
-// on and the summing decoder behind it, and builds their audio from the
-// shared corpus.
+// Whole listening periods of the engine with the voice activity module on and
+// the summing decoder behind it, and their audio from the shared corpus.
 #ifndef KVASR_TESTS_RELIABILITY_LISTENING_H_
 #define KVASR_TESTS_RELIABILITY_LISTENING_H_
 
@@ -8,6 +7,7 @@
 #include <string>
 #include <vector>
 
+#include "offline_asr_engine_impl.h"
 #include "summing_decoder.h"
 
 namespace kvasr_reliability {
@@ -24,16 +24,25 @@ std::vector<int16_t> QuietNoise(size_t samples, uint32_t seed);
 
 // Everything the host saw of one listening period.
 struct Transcript {
-  std::vector<summing_decoder::Segment> segments;  // final texts, in order
-  std::vector<std::string> messages;               // every message, verbatim
-  int failed_calls = 0;                            // process calls that returned false
+  std::vector<int64_t> segment_samples;  // of each final text, in order
+  std::vector<std::string> messages;     // every message, verbatim
 };
 
-// Initialises an engine on `model_dir`, starts it with `start_params`, feeds
-// `audio` in chunks of `chunk` samples, stops and closes it.
-Transcript Listen(const std::string& model_dir, const std::string& start_params,
-                  const std::vector<int16_t>& audio, int chunk);
+// An engine initialised on `model_dir` and started with `start_params`;
+// throws std::runtime_error when either fails.
+class Listener {
+ public:
+  Listener(const std::string& model_dir, const std::string& start_params);
+  // Feeds `audio` in chunks of `chunk` samples; returns how many were refused.
+  int Feed(const std::vector<int16_t>& audio, int chunk);
+  const Transcript& transcript() const { return transcript_; }
+  // Stops and closes the engine, which may deliver a last final text.
+  Transcript Finish();
 
+ private:
+  vorta::speech::OfflineAsrEngineImpl engine_;
+  Transcript transcript_;
+};
 
 }  // namespace kvasr_reliability
 

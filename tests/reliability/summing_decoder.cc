@@ -37,15 +37,10 @@ void Flush(Decoder* d) {
 
 }  // namespace
 
-bool ParseText(const std::string& text, Segment* segment) {
-  int64_t samples = 0;
+bool ParseSamples(const std::string& text, int64_t* samples) {
   uint64_t hash = 0;
-  if (std::sscanf(text.c_str(), "n%" SCNd64 " h%" SCNx64, &samples, &hash) != 2) return false;
-  segment->samples = samples;
-  segment->hash = hash;
-  return true;
+  return std::sscanf(text.c_str(), "n%" SCNd64 " h%" SCNx64, samples, &hash) == 2;
 }
-
 
 }  // namespace summing_decoder
 

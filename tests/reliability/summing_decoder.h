@@ -9,16 +9,9 @@
 
 namespace summing_decoder {
 
-// One final text of the decoder, read back from a result message.
-struct Segment {
-  int64_t samples = 0;
-  uint64_t hash = 0;
-};
-
-// Parses the text of a final result this decoder produced; false otherwise.
-bool ParseText(const std::string& text, Segment* segment);
-
-
+// The sample count in the text of a final result this decoder produced;
+// false for any other text.
+bool ParseSamples(const std::string& text, int64_t* samples);
 }  // namespace summing_decoder
 
 #endif  // KVASR_TESTS_RELIABILITY_SUMMING_DECODER_H_

@@ -9,7 +9,6 @@ clip=$data/librivox/sense_and_sensibility_01_austen_64kb-0880.wav
 work=$(mktemp -d)
 trap 'rm -rf "$work"' EXIT
 failures=0
-total=0
 
 # A regex, or "-" for an empty stream.
 matches() {
@@ -22,12 +21,7 @@ expect() {
   shift 5
   "$@" >"$work/out" 2>"$work/err"
   local got=$?
-  local ok=1
-  total=$((total + 1))
-  [ "$got" -eq "$status" ] || ok=0
-  matches "$out_re" "$work/out" || ok=0
-  matches "$err_re" "$work/err" || ok=0
-  if [ $ok -eq 1 ]; then
+  if [ "$got" -eq "$status" ] && matches "$out_re" "$work/out" && matches "$err_re" "$work/err"; then
     echo "ok   $name"
   else
     echo "FAIL $name: status $got (want $status)"
@@ -44,13 +38,11 @@ fi
 
 common=(--model "$manifest" --no-vad)
 
-expect "a recording is transcribed" 0 "young man" - -- \
-  "$kvasr" transcribe "${common[@]}" "$clip"
-
 expect "punctuated with the shipped model" 0 "^He was not .*young man[.?!]$" - -- \
   "$kvasr" transcribe "${common[@]}" --punct "$clip"
 
-# 44.1 kHz stereo of the same recording: channel mixing and resampling.
+# 44.1 kHz stereo of the same recording (channel mixing and resampling),
+# transcribed below among bad inputs.
 python3 -W ignore - "$clip" "$work/stereo44k.wav" <<'PY'
 import audioop, sys, wave
 with wave.open(sys.argv[1]) as w:
@@ -60,9 +52,6 @@ with wave.open(sys.argv[2], "wb") as w:
     w.setnchannels(2); w.setsampwidth(2); w.setframerate(44100)
     w.writeframes(audioop.tostereo(up, 2, 1, 1))
 PY
-expect "another rate and channel count give the same words" 0 "young man" - -- \
-  "$kvasr" transcribe "${common[@]}" "$work/stereo44k.wav"
-
 expect "raw sound from standard input" 0 "forward" - -- \
   sh -c "\"$kvasr\" transcribe --model \"$manifest\" --no-vad - < $data/goforward.raw"
 
@@ -73,7 +62,6 @@ echo "not sound" >"$work/text.wav"
 expect "a missing file and a text file fail alone" 1 "^$work/stereo44k.wav	.*young man" \
   "^kvasr: $work/missing.wav: .+" -- \
   "$kvasr" transcribe "${common[@]}" "$work/missing.wav" "$work/text.wav" "$work/stereo44k.wav"
-total=$((total + 1))
 if ! grep -q "^kvasr: $work/text.wav: " "$work/err" || [ "$(wc -l <"$work/err")" -ne 2 ]; then
   echo "FAIL one error line for each of the two bad inputs expected"
   failures=$((failures + 1))
@@ -111,7 +99,6 @@ expect "pitch of a synthetic 200 Hz tone" 0 "^100	(19[6-9]|20[0-4])\.[0-9]+$" - 
   "$kvasr" pitch "$work/tone200.wav"
 expect "pitch track of a recording" 0 "^# frame	f0_hz; .*t = 0.01\*i - 0.01003125 s" - -- \
   "$kvasr" pitch "$clip"
-total=$((total + 1))
 frames=$(grep -vc '^#' "$work/out")
 voiced=$(grep -v '^#' "$work/out" | awk '$2 >= 60 && $2 <= 450' | wc -l)
 if [ "$frames" -lt 100 ] || [ "$voiced" -lt $((frames / 10)) ]; then
@@ -120,5 +107,5 @@ if [ "$frames" -lt 100 ] || [ "$voiced" -lt $((frames / 10)) ]; then
 fi
 expect "pitch takes one file" 2 - "one input file" -- "$kvasr" pitch "$clip" "$clip"
 
-echo "$((total - failures)) passed, $failures failed"
+echo "$failures failed"
 [ "$failures" -eq 0 ]
