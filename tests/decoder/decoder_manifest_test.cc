@@ -77,9 +77,6 @@ TEST_F(DecoderManifest, ValidManifestsLoadQuietly) {
     EXPECT_EQ(outcome.error_output, "");
     mwDecoderDestroy(outcome.handle);
   }
-  const InitOutcome shipped = InitFromPath(KVASR_DECODER_MANIFEST);
-  EXPECT_NE(shipped.handle, nullptr) << shipped.error_output;
-  mwDecoderDestroy(shipped.handle);
 }
 
 TEST_F(DecoderManifest, EachFaultIsRejectedWithItsReason) {

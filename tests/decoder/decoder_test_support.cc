@@ -1,7 +1,7 @@
 #include "decoder_test_support.h"
 
+#include <algorithm>
 #include <cstdio>
-#include <cstring>
 
 #include "kvasr_decoder_api.h"
 

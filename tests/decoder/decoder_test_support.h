@@ -4,7 +4,6 @@
 #define KVASR_TESTS_DECODER_DECODER_TEST_SUPPORT_H_
 
 #include <gtest/gtest.h>
-#include <unistd.h>
 
 #include <cstdint>
 #include <string>
@@ -18,7 +17,6 @@ constexpr int64_t kSamplesPerMs = 16;
 constexpr int64_t kChunkSamples = 100 * kSamplesPerMs;
 
 using kvasr_test::LibrivoxClip;
-using kvasr_test::TestDataPath;
 
 struct Event {
   bool is_result;      // else speech end

@@ -16,9 +16,6 @@ common="--data $data --words 20000 --dev-words 3000 --epochs 1 --vocab 2000 --me
 "$check" "$out/encoder" "$out/encoder.tsv"
 "$python" "$training/train.py" $common --hidden 8 --init "$out/encoder" --out "$out/model" \
   --forward-check "$out/model.tsv"
-for f in model.bin vocab.txt punc.txt num.txt case.txt xdb.txt bpe.txt; do
-  test -s "$out/model/$f"
-done
 "$check" "$out/model" "$out/model.tsv"
 "$python" "$training/train.py" $common --hidden 8 --init "$out/model" --out "$out/more" \
   --forward-check "$out/more.tsv" | tee "$out/more.log"

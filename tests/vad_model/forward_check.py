@@ -33,6 +33,14 @@ THRESHOLD = -1.0
 RANDOM_FRAMES = 3000
 
 
+def trainer_scores(model_dir, rows):
+    """The trainer's forward pass on `rows`, each spliced as in training."""
+    weights, biases = model_io.read_network(os.path.join(model_dir, "quellan_data_b"))
+    priors = model_io.read_priors(os.path.join(model_dir, "quellan_data_c"))
+    x = rows[frames.splice_index(len(rows))].reshape(len(rows), -1)
+    return network.detector_scores(weights, biases, priors, x).astype(np.float64)
+
+
 def module_scores(tool, model_dir, rows_path, work_dir):
     out = os.path.join(work_dir, "module_scores.f32")
     subprocess.run([tool, model_dir, rows_path, out], check=True)
@@ -67,10 +75,7 @@ def check_deployed(model_dir, rows_path, table_path):
                                        os.path.basename(table_path)[:-len(".tsv")])[:, 0]
     if len(rows) != len(reported) or len(rows) < 50:
         sys.exit("%d rows against %d frame records" % (len(rows), len(reported)))
-    weights, biases = model_io.read_network(os.path.join(model_dir, "quellan_data_b"))
-    priors = model_io.read_priors(os.path.join(model_dir, "quellan_data_c"))
-    x = rows[frames.splice_index(len(rows))].reshape(len(rows), -1)
-    trainer = network.detector_scores(weights, biases, priors, x).astype(np.float64)
+    trainer = trainer_scores(model_dir, rows)
     evaluated = np.arange(0, len(rows), EVALUATION_STRIDE_FRAMES)
     diff = np.abs(trainer[evaluated] - reported[evaluated])
     print("%d evaluated frames, largest difference %.2e" % (len(evaluated), diff.max()))
@@ -98,11 +103,7 @@ def main():
             + 0.5 * rng.standard_normal((RANDOM_FRAMES, frames.FEAT_DIM))).astype("<f4")
     rows_path = os.path.join(work_dir, "rows.f32")
     rows.tofile(rows_path)
-    weights, biases = model_io.read_network(os.path.join(model_dir, "quellan_data_b"))
-    priors = model_io.read_priors(os.path.join(model_dir, "quellan_data_c"))
-    x = rows[frames.splice_index(len(rows))].reshape(len(rows), -1)
-    trainer = network.detector_scores(weights, biases, priors, x).astype(np.float64)
-    compare(module_scores(tool, model_dir, rows_path, work_dir), trainer)
+    compare(module_scores(tool, model_dir, rows_path, work_dir), trainer_scores(model_dir, rows))
 
 
 if __name__ == "__main__":

@@ -19,20 +19,15 @@ constexpr int kRateHz = 16000;
 constexpr int kFrameShiftSamples = 160;
 constexpr int kWindowSamples = 400;
 
+// Keeps every report, with a copy of the row it points to.
 class Recorder : public VadFrameObserver {
  public:
   void on_frame(const VadFrameReport& r) override {
-    frames.push_back(r.frame);
+    reports.push_back(r);
     rows.emplace_back(r.features, r.features + r.feat_dim);
-    scores.push_back(r.score);
-    smoothed.push_back(r.smoothed);
-    energy.push_back(r.energy_speech);
-    speech.push_back(r.speech);
   }
-  std::vector<int> frames;
+  std::vector<VadFrameReport> reports;
   std::vector<std::vector<float>> rows;
-  std::vector<float> scores, smoothed;
-  std::vector<int> energy, speech;
 };
 
 // Loud tone bursts of 0.6 s between 0.9 s pauses of faint noise.
@@ -72,19 +67,19 @@ TEST(FrameObserver, ReportsEveryFrameOnceWithTheRowTheNetworkScored) {
     quellan_test::RunUtterance(&pipe, audio, chunk);
     const int expected = (static_cast<int>(audio.size()) - kWindowSamples) /
                              kFrameShiftSamples + 1;
-    ASSERT_EQ(static_cast<int>(recorder.frames.size()), expected);
+    ASSERT_EQ(static_cast<int>(recorder.reports.size()), expected);
     int speech_frames = 0;
     for (int f = 0; f < expected; ++f) {
-      ASSERT_EQ(recorder.frames[f], f);
+      const VadFrameReport& r = recorder.reports[f];
+      ASSERT_EQ(r.frame, f);
       // Every frame is evaluated: its score follows its own C0 column.
       const float c0 = recorder.rows[f][kC0Column];
       if (std::fabs(c0) > 0.05f) {
-        EXPECT_EQ(recorder.scores[f] > 0.0f, c0 > 0.0f) << "frame " << f;
+        EXPECT_EQ(r.score > 0.0f, c0 > 0.0f) << "frame " << f;
       }
       // Without smoothing the decision is the score and the energy gate.
-      EXPECT_EQ(recorder.speech[f],
-                recorder.smoothed[f] > -1.0f && recorder.energy[f] == 1 ? 1 : 0);
-      speech_frames += recorder.speech[f];
+      EXPECT_EQ(r.speech, r.smoothed > -1.0f && r.energy_speech == 1 ? 1 : 0);
+      speech_frames += r.speech;
     }
     EXPECT_GT(speech_frames, expected / 10);
     EXPECT_LT(speech_frames, expected * 9 / 10);
@@ -109,11 +104,11 @@ TEST(FrameObserver, WatchingChangesNoOutputAndUnsettingStopsReports) {
     any_speech = any_speech || a[i].speech;
   }
   EXPECT_TRUE(any_speech);
-  const size_t reported = recorder.frames.size();
+  const size_t reported = recorder.reports.size();
   EXPECT_GT(reported, 0u);
   watched.set_frame_observer(nullptr);
   quellan_test::RunUtterance(&watched, audio, 1600);
-  EXPECT_EQ(recorder.frames.size(), reported);
+  EXPECT_EQ(recorder.reports.size(), reported);
 }
 
 }  // namespace
