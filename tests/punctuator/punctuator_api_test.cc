@@ -156,12 +156,12 @@ TEST_F(ModelTest, AllocatesNothingOnceBuffersHaveGrownToTheLongestText) {
   char out[1024];
   int32_t size = sizeof out;
   ASSERT_EQ(punctuator_do_it(handle_, texts[0], out, &size), 0);
-  const long before = quellan_test::AllocationCount();
+  const long before = kvasr_test::AllocationCount();
   for (const char* text : texts) {
     size = sizeof out;
     EXPECT_EQ(punctuator_do_it(handle_, text, out, &size), 0);
   }
-  EXPECT_EQ(quellan_test::AllocationCount() - before, 0);
+  EXPECT_EQ(kvasr_test::AllocationCount() - before, 0);
 }
 
 TEST_F(ModelTest, BadArgumentsFail) {

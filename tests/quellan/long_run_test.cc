@@ -52,7 +52,7 @@ TEST(LongRunTest, MemoryDoesNotGrowWithListeningTime) {
   unsigned seed = 1;
   int index = 0;
   long after_warm_up = 0;
-  const long allocations_before = quellan_test::AllocationCount();
+  const long allocations_before = kvasr_test::AllocationCount();
   ASSERT_GT(allocations_before, 0) << "the counter sees the pipeline being built";
   // Alternating loud and quiet seconds for fifteen minutes.
   for (int second = 0; second < 15 * 60; ++second) {
@@ -70,7 +70,7 @@ TEST(LongRunTest, MemoryDoesNotGrowWithListeningTime) {
     }
     if (second == 180) after_warm_up = quellan_test::ResidentKiB();
   }
-  EXPECT_EQ(quellan_test::AllocationCount() - allocations_before, 0)
+  EXPECT_EQ(kvasr_test::AllocationCount() - allocations_before, 0)
       << "allocations while processing";
   ASSERT_GT(after_warm_up, 0);
   EXPECT_LE(quellan_test::ResidentKiB() - after_warm_up, 256)

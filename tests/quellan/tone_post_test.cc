@@ -83,7 +83,7 @@ TEST(ToneStateTest, SelectionOfCentreFrame) {
 TEST(ToneStateTest, PushAndFlushNeverAllocate) {
   auto s = Fresh();
   std::vector<float> frame(kToneOutFloats);
-  const long before = quellan_test::AllocationCount();
+  const long before = kvasr_test::AllocationCount();
   for (int i = 0; i < 300; ++i) {
     // Voiced runs with octave jumps and gaps exercise every selection path.
     const float pitch =
@@ -92,7 +92,7 @@ TEST(ToneStateTest, PushAndFlushNeverAllocate) {
     ToneStateTake(s.get(), frame.data());
   }
   ToneStateFlush(s.get(), frame.data());
-  EXPECT_EQ(quellan_test::AllocationCount() - before, 0);
+  EXPECT_EQ(kvasr_test::AllocationCount() - before, 0);
 }
 
 TEST(ToneStateTest, WarnsWhenOutputIsNotTaken) {

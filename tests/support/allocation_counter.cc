@@ -21,8 +21,8 @@ void* operator new(std::size_t size) {
 void operator delete(void* p) noexcept { std::free(p); }
 void operator delete(void* p, std::size_t) noexcept { std::free(p); }
 
-namespace quellan_test {
+namespace kvasr_test {
 
 long AllocationCount() { return g_allocations; }
 
-}  // namespace quellan_test
+}  // namespace kvasr_test
