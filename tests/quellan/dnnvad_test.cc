@@ -135,7 +135,7 @@ TEST(DetectorTest, SegmentsOfOneCall) {
 }
 
 TEST(DetectorTest, GapAcrossCallsNeedsThirtyOneFrames) {
-  for (int gap : {29, 30, 31}) {
+  for (int gap : {29, 30, 31, 32}) {
     SCOPED_TRACE(gap);
     DetectorHarness h(Pattern(200, {{20, 60}, {60 + gap, 120}}));
     // Batch 0..69: speech 20..59, then ten silent frames.
@@ -148,11 +148,29 @@ TEST(DetectorTest, GapAcrossCallsNeedsThirtyOneFrames) {
       EXPECT_EQ(second.intervals, (Intervals{{61, 120 + 79 / 2}}));
       EXPECT_EQ(second.cuts, (std::vector<int>{159}));
     } else {
-      // Carried 9 + lead 21 = 30 frames close the segment at 70 + (22 - 9) / 2.
-      EXPECT_EQ(second.intervals, (Intervals{{61, 76}, {76, 159}}));
-      EXPECT_EQ(second.cuts, (std::vector<int>{76, 159}));
+      // Carried 9 + lead (gap - 10) frames close the segment at
+      // 70 + (lead + 1 - 9) / 2; the next one starts a margin before its speech.
+      const int cut = 70 + (gap - 10 + 1 - 9) / 2;
+      EXPECT_EQ(second.intervals, (Intervals{{61, cut}, {60 + gap - 15, 159}}));
+      EXPECT_EQ(second.cuts, (std::vector<int>{cut, 159}));
     }
   }
+}
+
+// The smoothed score runs on from one call into the next: speech that starts
+// with a call's first evaluated frame is found as late as inside one call.
+TEST(DetectorTest, SmoothedScoreCarriesAcrossCalls) {
+  const std::vector<bool> speech = Pattern(300, {{100, 200}});
+  DetectorHarness whole(speech), split(speech);
+  whole.conf().score_smooth = split.conf().score_smooth = 0.8f;
+  const CallResult one_call = whole.FeedAll();
+  // The first call evaluates frames 0..99, the second starts at frame 100.
+  ASSERT_TRUE(split.Feed(105, false).intervals.empty());
+  const CallResult second_call = split.Feed(195, true);
+  ASSERT_FALSE(one_call.intervals.empty());
+  ASSERT_FALSE(second_call.intervals.empty());
+  EXPECT_EQ(one_call.intervals[0].first, 102 - 15) << "three smoothed frames to cross";
+  EXPECT_EQ(second_call.intervals[0].first, one_call.intervals[0].first);
 }
 
 TEST(DetectorTest, ShortBatchesWithoutDueEvaluationCarryTheScore) {
