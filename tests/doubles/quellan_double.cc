@@ -37,7 +37,7 @@ using namespace quellan_double;
 
 extern "C" void* quellan_create(const char* dir) {
   world().calls.push_back({"quellan_create", 0, 0, 0});
-  if (dir == world().null_dir) return nullptr;
+  if (dir != nullptr && dir == world().null_dir) return nullptr;
   // Distinct non-null tokens; never dereferenced.
   void* handle = reinterpret_cast<void*>(world().next_handle++ << 4);
   world().handles.insert(handle);

@@ -150,9 +150,14 @@ TEST_F(EngineTest, InitRefusesBadParametersWithTheirLogLines) {
       EXPECT_EQ(decoder_double::Count("mwDecoderInit"), 0);
     }
   }
-  // Malformed JSON is reported like any other refusal, never thrown.
-  EXPECT_NE(Init(engine_, "{", false).find("OfflineAsrEngineImpl->asr init exception:"),
-            std::string::npos);
+  // Malformed JSON and JSON that is not an object are reported like any
+  // other refusal, never thrown.
+  for (const char* params : {"", "{", "[1,2]", "\"text\"", "{\"lang\":}"}) {
+    OfflineAsrEngineImpl engine;
+    EXPECT_NE(Init(engine, params, false).find("OfflineAsrEngineImpl->asr init exception:"),
+              std::string::npos)
+        << params;
+  }
 }
 
 // Kept as it always was: a refused decoder, and the segment buffer made
