@@ -92,6 +92,7 @@ class Pieces:
     utterance follow each other without gap or overlap."""
 
     def __init__(self, frame_set):
+        self.frame_set = frame_set
         starts, first_loss = [], []
         for _, offset, count in frame_set.spans:
             for begin in range(0, count - PIECE_FRAMES + 1, PIECE_LOSS_FRAMES):
@@ -103,9 +104,10 @@ class Pieces:
     def __len__(self):
         return len(self.starts)
 
-    def batches(self, frame_set, frame_weight, batch, rng):
+    def batches(self, frame_weight, batch, rng):
         """(frames to score, gradient function) for each batch of pieces, in
         random order."""
+        frame_set = self.frame_set
         order = rng.permutation(len(self))
         offsets = np.arange(PIECE_FRAMES)
         for i in range(0, len(order), batch):

@@ -86,7 +86,7 @@ def train_one(hidden, train, weights, val, conditions, priors, args, rng):
     steps = 0
     started = time.time()
     for epoch in range(args.epochs):
-        batches = pieces.batches(train, weights, args.batch, rng) if pieces \
+        batches = pieces.batches(weights, args.batch, rng) if pieces \
             else frame_batches(train, weights, args.batch, rng)
         losses = []
         for which, gradients in batches:
