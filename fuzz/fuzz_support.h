@@ -2,22 +2,18 @@
 #ifndef KVASR_FUZZ_FUZZ_SUPPORT_H_
 #define KVASR_FUZZ_FUZZ_SUPPORT_H_
 
-#include <stdlib.h>
-
 #include <cstdint>
 #include <cstdio>
+#include <cstdlib>
 #include <string>
+
+#include "temp_dir.h"
 
 namespace kvasr_fuzz {
 
 // A fresh folder, made once per process; the loaders under test take paths.
 inline const std::string& ScratchDir() {
-  static const std::string dir = [] {
-    const char* base = std::getenv("TMPDIR");
-    std::string pattern = std::string(base != nullptr ? base : "/tmp") + "/kvasr_fuzz_XXXXXX";
-    if (mkdtemp(pattern.data()) == nullptr) std::abort();
-    return pattern;
-  }();
+  static const std::string dir = kvasr_test::ProcessTempDir();
   return dir;
 }
 

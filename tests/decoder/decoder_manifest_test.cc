@@ -1,7 +1,6 @@
 // Reading the model manifest through mwDecoderInit: every fault gives a null
 // handle and one explaining line on standard error.
 #include <gtest/gtest.h>
-#include <unistd.h>
 
 #include <cstdio>
 #include <filesystem>
@@ -9,6 +8,7 @@
 #include <string>
 
 #include "kvasr_decoder_api.h"
+#include "temp_dir.h"
 
 namespace {
 
@@ -43,20 +43,14 @@ InitOutcome InitFromPath(const fs::path& path) {
 // A fresh folder for manifests, removed with what it holds.
 class DecoderManifest : public testing::Test {
  protected:
-  void SetUp() override {
-    char name[] = "/tmp/kvasr-decoder-test-XXXXXX";
-    ASSERT_NE(mkdtemp(name), nullptr);
-    dir_ = name;
-  }
-  void TearDown() override { fs::remove_all(dir_); }
-
   fs::path Write(const std::string& text) {
     const fs::path path = dir_ / "model.manifest";
     std::ofstream(path, std::ios::binary | std::ios::trunc) << text;
     return path;
   }
 
-  fs::path dir_;
+  kvasr_test::TempDir tmp_;
+  const fs::path dir_{tmp_.path()};
 };
 
 void ExpectRejected(const InitOutcome& outcome, const std::string& fragment) {

@@ -1,7 +1,6 @@
 // The library through its three C functions, with the shipped English model.
 #include <gtest/gtest.h>
 
-#include <unistd.h>
 
 #include <array>
 #include <cctype>
@@ -14,6 +13,7 @@
 #include "allocation_counter.h"
 #include "kvasr_punctuator_api.h"
 #include "librivox.h"
+#include "temp_dir.h"
 
 namespace {
 
@@ -191,22 +191,15 @@ TEST(ModelWithoutOptionalFiles, WorksAndLeavesNumbersInWords) {
 class BrokenModelTest : public testing::Test {
  protected:
   void SetUp() override {
-    char tmpl[] = "/tmp/kvasr-punct-XXXXXX";
-    ASSERT_NE(mkdtemp(tmpl), nullptr);
-    dir_ = tmpl;
-    paths_ = PathsIn(dir_);
+    paths_ = PathsIn(dir_.path());
     for (const char* name : kFileNames) {
       std::ifstream in(kModelDir + "/" + name, std::ios::binary);
-      std::ofstream(dir_ + "/" + name, std::ios::binary) << in.rdbuf();
+      std::ofstream(dir_.path() + "/" + name, std::ios::binary) << in.rdbuf();
     }
     // Otherwise every refusal below could pass for the wrong reason.
     void* h = Init(paths_);
     ASSERT_NE(h, nullptr);
     punctuator_relese(h);
-  }
-  void TearDown() override {
-    for (const std::string& path : paths_) std::remove(path.c_str());
-    rmdir(dir_.c_str());
   }
   std::string Read(FileIndex f) {
     std::ifstream in(paths_[f], std::ios::binary);
@@ -216,14 +209,14 @@ class BrokenModelTest : public testing::Test {
     std::ofstream(paths_[f], std::ios::binary | std::ios::trunc) << content;
   }
 
-  std::string dir_;
+  kvasr_test::TempDir dir_;
   Paths paths_;
 };
 
 TEST_F(BrokenModelTest, MissingFilesAndUnknownLanguages) {
   for (const FileIndex f : {kModel, kVocab, kPunc, kNum, kCase, kXdb, kBpe}) {
     Paths p = paths_;
-    p[f] = dir_ + "/absent.txt";
+    p[f] = dir_.path() + "/absent.txt";
     EXPECT_NE(FailingInit(p).find("absent.txt"), std::string::npos) << kFileNames[f];
     if (f == kNum || f == kCase || f == kXdb) continue;
     p[f] = "";

@@ -10,6 +10,7 @@
 
 #include "model_files.h"
 #include "quellan_conf.h"
+#include "temp_dir.h"
 
 namespace {
 
@@ -33,7 +34,7 @@ class DetectorHarness {
  public:
   explicit DetectorHarness(std::vector<bool> speech, const std::vector<bool>& loud = {})
       : speech_(std::move(speech)) {
-    const std::string dir = quellan_test::MakeTempDir();
+    const std::string dir = kvasr_test::ProcessTempDir();
     quellan_test::WriteNetwork(dir + "/quellan_data_b", quellan_test::SignNetwork(1, 5, 5, 0));
     quellan_test::WritePriors(dir + "/quellan_data_c", {1.0f, 1.0f});
     load_vad_dnn_conf(dir.c_str(), 1000, &conf_);

@@ -1,13 +1,14 @@
 #include "model_files.h"
 
 #include <sndfile.h>
-#include <stdlib.h>
 #include <unistd.h>
 
 #include <cstdio>
 #include <fstream>
 #include <iterator>
 #include <stdexcept>
+
+#include "temp_dir.h"
 
 namespace quellan_test {
 
@@ -77,18 +78,8 @@ Network SignNetwork(int feat_dim, int start_offset, int end_offset,
   return net;
 }
 
-std::string MakeTempDir() {
-  const char* base = std::getenv("TMPDIR");
-  std::string pattern = std::string(base != nullptr ? base : "/tmp") +
-                        "/quellan_test_XXXXXX";
-  if (mkdtemp(pattern.data()) == nullptr) {
-    throw std::runtime_error("mkdtemp failed");
-  }
-  return pattern;
-}
-
 std::string MakeModelDir(float score, int row_width) {
-  const std::string dir = MakeTempDir();
+  const std::string dir = kvasr_test::ProcessTempDir();
   WriteNetwork(dir + "/quellan_data_b", ConstantNetwork(row_width * 11, score));
   WritePriors(dir + "/quellan_data_c", {1.0f, 1.0f});
   WriteMeanTable(dir + "/quellan_data_a", std::vector<float>(39, 0.0f),

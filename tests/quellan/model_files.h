@@ -37,10 +37,7 @@ Network SignNetwork(int feat_dim, int start_offset, int end_offset, int column);
 // A network that scores every frame alike, about `score`.
 Network ConstantNetwork(int input_length, float score);
 
-// A fresh empty directory under the test's temporary folder.
-std::string MakeTempDir();
-
-// A model directory holding a constant-score network over eleven rows of
+// A model directory, removed at exit, holding a constant-score network over eleven rows of
 // `row_width` values, priors of 1 and a mean table of zero means and unit
 // variances.
 std::string MakeModelDir(float score, int row_width = 39);

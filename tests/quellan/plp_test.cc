@@ -9,6 +9,7 @@
 
 #include "model_files.h"
 #include "plp_config.h"
+#include "temp_dir.h"
 
 namespace {
 
@@ -46,7 +47,7 @@ std::string Table(uint32_t n, size_t floats) {
 }
 
 TEST(PlpTableTest, RefusesBadSettingsAndTables) {
-  const std::string path = quellan_test::MakeTempDir() + "/table";
+  const std::string path = kvasr_test::ProcessTempDir() + "/table";
   const std::string good = Table(kWidth, 2 * kWidth);
   const struct {
     void (*change)(PlpConfig*);
@@ -79,7 +80,7 @@ TEST(PlpTableTest, RefusesBadSettingsAndTables) {
 }
 
 TEST(PlpBlockTest, RefusesEmptyAndOversizedBlocks) {
-  const std::string path = quellan_test::MakeTempDir() + "/table";
+  const std::string path = kvasr_test::ProcessTempDir() + "/table";
   quellan_test::WriteMeanTable(path, std::vector<float>(kWidth, 0.0f),
                                std::vector<float>(kWidth, 1.0f));
   PlpConfig conf = Defaults();

@@ -7,6 +7,7 @@
 #include <vector>
 
 #include "model_files.h"
+#include "temp_dir.h"
 
 namespace {
 
@@ -16,7 +17,7 @@ std::string Bytes(const std::vector<int32_t>& ints) {
 
 class VadDnnTest : public testing::Test {
  protected:
-  void SetUp() override { dir_ = quellan_test::MakeTempDir(); }
+  void SetUp() override { dir_ = kvasr_test::ProcessTempDir(); }
   std::string Path(const std::string& name) const { return dir_ + "/" + name; }
 
   // A network over 1 x (2 + 1 + 2) inputs with `classes` outputs, its

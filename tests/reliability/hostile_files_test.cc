@@ -11,6 +11,7 @@
 
 #include "model_files.h"
 #include "offline_asr_engine_impl.h"
+#include "temp_dir.h"
 
 namespace vorta {
 namespace speech {
@@ -33,7 +34,7 @@ std::string Floats(const std::vector<float>& v) {
 Network GoodNetwork() { return quellan_test::ConstantNetwork(kWidth * 11, 16.0f); }
 
 std::string NetworkBytes(const Network& net) {
-  const std::string path = quellan_test::MakeTempDir() + "/net";
+  const std::string path = kvasr_test::ProcessTempDir() + "/net";
   quellan_test::WriteNetwork(path, net);
   return quellan_test::ReadBytes(path);
 }

@@ -4,27 +4,23 @@
 
 #include <gtest/gtest.h>
 
-#include <cstdio>
 #include <fstream>
 #include <string>
-#include <unistd.h>
+
+#include "temp_dir.h"
 
 namespace kvasr_test {
 
 // A file that exists for the life of the object.
 class TempFile {
  public:
-  explicit TempFile(const std::string& content) {
-    char name[] = "/tmp/kvasr-test-XXXXXX";
-    const int fd = mkstemp(name);
-    if (fd >= 0) close(fd);
-    path_ = name;
+  explicit TempFile(const std::string& content) : path_(dir_.path() + "/file") {
     std::ofstream(path_, std::ios::binary) << content;
   }
-  ~TempFile() { std::remove(path_.c_str()); }
   const std::string& path() const { return path_; }
 
  private:
+  TempDir dir_;
   std::string path_;
 };
 

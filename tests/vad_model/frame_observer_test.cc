@@ -8,6 +8,7 @@
 #include "model_files.h"
 #include "pipeline_harness.h"
 #include "quellan.h"
+#include "temp_dir.h"
 
 namespace {
 
@@ -46,7 +47,7 @@ std::vector<int16_t> Bursts(double seconds) {
 
 struct Model {
   std::string dir;
-  Model() : dir(quellan_test::MakeTempDir()) {
+  Model() : dir(kvasr_test::ProcessTempDir()) {
     quellan_test::WriteNetwork(dir + "/quellan_data_b",
                                quellan_test::SignNetwork(kFeatDim, 5, 5, kC0Column));
     quellan_test::WritePriors(dir + "/quellan_data_c", {1.0f, 1.0f});
