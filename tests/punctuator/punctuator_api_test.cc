@@ -1,7 +1,6 @@
 // The library through its three C functions, with the shipped English model.
 #include <gtest/gtest.h>
 
-
 #include <array>
 #include <cctype>
 #include <cstdint>

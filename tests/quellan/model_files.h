@@ -37,9 +37,9 @@ Network SignNetwork(int feat_dim, int start_offset, int end_offset, int column);
 // A network that scores every frame alike, about `score`.
 Network ConstantNetwork(int input_length, float score);
 
-// A model directory, removed at exit, holding a constant-score network over eleven rows of
-// `row_width` values, priors of 1 and a mean table of zero means and unit
-// variances.
+// A model directory, removed at exit, holding a constant-score network over
+// eleven rows of `row_width` values, priors of 1 and a mean table of zero
+// means and unit variances.
 std::string MakeModelDir(float score, int row_width = 39);
 
 // Audio of the shared corpus; tests skip when it is absent.

@@ -5,6 +5,7 @@
 
 #include <stdlib.h>
 
+#include <cstdlib>
 #include <deque>
 #include <filesystem>
 #include <mutex>
@@ -41,7 +42,7 @@ class TempDir {
 // that hand out bare paths.
 inline std::string ProcessTempDir() {
   static std::mutex mutex;
-  static std::deque<TempDir> dirs;  // a deque never moves its elements
+  static std::deque<TempDir> dirs;  // growing a deque leaves its elements in place
   std::lock_guard<std::mutex> lock(mutex);
   return dirs.emplace_back().path();
 }
