@@ -20,15 +20,14 @@ constexpr int kRateHz = 16000;
 constexpr int kFrameShiftSamples = 160;
 constexpr int kWindowSamples = 400;
 
-// Keeps every report, with a copy of the row it points to.
-class Recorder : public VadFrameObserver {
- public:
+// Keeps every report too; its row pointer is only good during the call, so
+// the rows are read from the log's copies.
+struct Recorder : quellan_test::RowLog {
   void on_frame(const VadFrameReport& r) override {
+    RowLog::on_frame(r);
     reports.push_back(r);
-    rows.emplace_back(r.features, r.features + r.feat_dim);
   }
   std::vector<VadFrameReport> reports;
-  std::vector<std::vector<float>> rows;
 };
 
 // Loud tone bursts of 0.6 s between 0.9 s pauses of faint noise.
@@ -74,7 +73,7 @@ TEST(FrameObserver, ReportsEveryFrameOnceWithTheRowTheNetworkScored) {
       const VadFrameReport& r = recorder.reports[f];
       ASSERT_EQ(r.frame, f);
       // Every frame is evaluated: its score follows its own C0 column.
-      const float c0 = recorder.rows[f][kC0Column];
+      const float c0 = recorder.rows[static_cast<size_t>(f) * kFeatDim + kC0Column];
       if (std::fabs(c0) > 0.05f) {
         EXPECT_EQ(r.score > 0.0f, c0 > 0.0f) << "frame " << f;
       }
