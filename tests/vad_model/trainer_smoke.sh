@@ -19,10 +19,57 @@ fi
 rm -rf "$work"
 mkdir -p "$work"
 cd "$work"
+# A tiny package corpus standing in for the downloaded one: a voice package,
+# a music package and an effects package of the training part, one effects
+# package of dev.
+PYTHONPATH=$training "$python" - "$corpus" packages <<'EOF_FIXTURE'
+import os, sys
+import numpy as np, soundfile
+import corpus, packages
+shared, out = sys.argv[1], sys.argv[2]
+rng = np.random.default_rng(7)
+speech = [r for r in corpus.read_manifest(shared) if r["kind"] == "speech"][:2]
+rows = []
+def add(pkg, kind, name, x, speaker=""):
+    path = "%s/%s.wav" % (pkg, name)
+    os.makedirs(os.path.join(out, pkg), exist_ok=True)
+    soundfile.write(os.path.join(out, path), x.astype(np.float32), 16000, subtype="PCM_16")
+    rows.append({"path": path, "kind": kind, "source": pkg, "speaker": speaker,
+                 "duration_s": "%.3f" % (len(x) / 16000)})
+for i, r in enumerate(speech):
+    add("fillets-ng-data-cs", "speech", "line%d" % i, soundfile.read(r["file"])[0], "fillets-ng-data-cs")
+t = np.arange(48000) / 16000
+add("wesnoth-1.16-music", "music", "tune", 0.2 * np.sin(2 * np.pi * 220 * t) * (1 + np.sin(3 * t)))
+for pkg in ("lmms-common", "oxygen-sounds"):
+    add(pkg, "noise", "hit", rng.standard_normal(8000) * np.exp(-np.arange(8000) / 800) * 0.3)
+packages.write_manifest(out, rows)
+parts = corpus.load(shared, out)
+got = {p: sorted({r["category"] for r in parts[p] if r["source"] in packages.PACKAGES}) for p in parts}
+assert got["train"] == ["effects/pkg/lmms-common", "music/pkg/wesnoth-1.16-music",
+                        "speech/pkg/fillets-ng-data-cs"], got
+assert got["dev"] == ["effects/pkg/oxygen-sounds"] and got["val"] == [], got
+# Voices in non-speech packages never enter as non-speech.
+cases = {
+    ("freedroidrpg-data", "usr/share/freedroidrpg/data/sound/effects/bot_sounds/voice_samples/1.ogg"): None,
+    ("freedroidrpg-data", "usr/share/freedroidrpg/data/sound/effects/bullets/Single_Laser.ogg"): "noise",
+    ("boswars-data", "usr/share/games/boswars/units/medic/medic_select.wav"): None,
+    ("megaglest-data", "usr/share/games/megaglest/techs/megapack/factions/magic/units/initiate/sounds/initiate_attack1.wav"): None,
+    ("fillets-ng-data", "usr/share/games/fillets-ng/sound/elk/en/elk-m-1.ogg"): None,
+    ("supertux-data", "usr/share/games/supertux2/music/forest/forest.ogg"): "music",
+    ("warzone2100-music", "usr/share/games/warzone2100/music/albums/legacy_soundtrack/track1.ogg"): "music",
+    ("hyperrogue-music", "usr/share/hyperrogue/sounds/bounce.ogg"): "noise",
+    ("qabcs-data", "usr/share/qabcs/abcs/all/noises/cat.ogg"): "noise",
+    ("qabcs-data", "usr/share/qabcs/abcs/en/sounds/words/cat.ogg"): "speech",
+    ("kajongg", "usr/share/kajongg/voices/de/male1/pung.ogg"): "speech",
+}
+for (pkg, rel), kind in cases.items():
+    assert packages.classify(pkg, rel)[0] == kind, (pkg, rel, packages.classify(pkg, rel))
+EOF_FIXTURE
 for part in train val; do
-  "$python" "$training/mix.py" --corpus "$corpus" --part $part --out mix/$part \
-    --speech-mixtures 1 --nospeech-mixtures 1 --seconds 6
+  "$python" "$training/mix.py" --corpus "$corpus" --packages packages --part $part \
+    --out mix/$part --speech-mixtures 1 --nospeech-mixtures 1 --seconds 6
 done
+grep -q "^train_effects_000	effects	" mix/train/mixtures.tsv || { cat mix/train/mixtures.tsv; exit 1; }
 "$python" "$training/mean_table.py" seed seed
 mkdir -p pass1
 "$kvasr" vad --vad-models seed --dump pass1 mix/train/*.wav > /dev/null

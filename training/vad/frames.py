@@ -8,7 +8,7 @@ FEAT_DIM = 39
 LEFT_CONTEXT_FRAMES = 5
 RIGHT_CONTEXT_FRAMES = 5
 # Mixture kinds as mix.py writes them: speech, or a speech-free stretch.
-NOSPEECH_KINDS = ("music", "noise", "silence")
+NOSPEECH_KINDS = ("music", "effects", "noise", "silence")
 SPLICE_FRAMES = 1 + LEFT_CONTEXT_FRAMES + RIGHT_CONTEXT_FRAMES
 
 

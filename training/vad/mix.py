@@ -77,13 +77,13 @@ def db_to_amp(db):
 
 
 class Audio:
-    def __init__(self, corpus_dir):
-        self.dir = corpus_dir
+    def __init__(self):
         self.cache = {}
 
-    def load(self, path):
+    def load(self, row):
+        path = row["file"]
         if path not in self.cache:
-            x, rate = soundfile.read(os.path.join(self.dir, path), dtype="float64")
+            x, rate = soundfile.read(path, dtype="float64")
             assert rate == RATE_HZ and x.ndim == 1, path
             self.cache[path] = x * FULL_SCALE
         return self.cache[path]
@@ -108,7 +108,7 @@ def pick(rows, rng):
 def background(audio, rows, length, rng):
     """`length` samples of one background file, looped from a random start."""
     row = pick(rows, rng)
-    x = audio.load(row["path"])
+    x = audio.load(row)
     start = rng.randrange(len(x))
     reps = (start + length) // len(x) + 1
     return np.tile(x, reps)[start:start + length], row
@@ -138,7 +138,7 @@ def speech_mixture(audio, speech_rows, noise_rows, target_s, snr_db, rng,
     target = int(target_s * RATE_HZ)
     while pos < target:
         row = pick(speech_rows, rng)
-        clip = audio.load(row["path"])
+        clip = audio.load(row)
         rms, _ = active_rms(clip)
         gain = db_to_amp(level_db + rng.uniform(-UTTERANCE_JITTER_DB,
                                                 UTTERANCE_JITTER_DB)) * FULL_SCALE / rms
@@ -182,7 +182,7 @@ def nospeech_mixture(audio, rows, target_s, kind, rng):
         parts, names, total = [], [], 0
         while total < length:
             row = pick(rows, rng)
-            clip = audio.load(row["path"])
+            clip = audio.load(row)
             rms = math.sqrt(max(np.mean(clip ** 2), 1e-9))
             parts.append(clip * db_to_amp(level_db) * FULL_SCALE / rms)
             names.append(row["path"])
@@ -209,13 +209,15 @@ def write(out_dir, name, mix, labels, meta, index_file):
 def main():
     ap = argparse.ArgumentParser(description=__doc__,
                                  formatter_class=argparse.RawDescriptionHelpFormatter)
-    ap.add_argument("--corpus", required=True)
+    ap.add_argument("--corpus", required=True, help="the shared corpus")
+    ap.add_argument("--packages", help="the package corpus that packages.py decodes")
     ap.add_argument("--part", choices=("train", "val", "dev"), required=True)
     ap.add_argument("--out", required=True)
     ap.add_argument("--speech-mixtures", type=int, required=True,
                     help="speech mixtures per SNR condition")
     ap.add_argument("--nospeech-mixtures", type=int, required=True,
-                    help="speech-free mixtures of each kind (music, noise, silence)")
+                    help="speech-free mixtures of each kind (music, noise, silence, and "
+                         "effects with --packages)")
     ap.add_argument("--seconds", type=float, default=30.0)
     ap.add_argument("--seed", type=int, default=1)
     ap.add_argument("--label-range-db", type=float, default=LABEL_RANGE_DB,
@@ -223,15 +225,21 @@ def main():
                          "labels change, the audio and its levels do not")
     args = ap.parse_args()
 
-    rows = corpus.split(corpus.read_manifest(args.corpus))[args.part]
+    rows = corpus.load(args.corpus, args.packages)[args.part]
     speech = [r for r in rows if r["kind"] == "speech"]
     noise = [r for r in rows if r["kind"] != "speech"]
     music = [r for r in noise if r["category"].startswith("music/")]
+    effects = [r for r in noise if r["category"].startswith("effects/")]
     # Babble holds unintelligible voices: a background under speech, never a
     # speech-free stretch whose every frame must be rejected.
-    plain_noise = [r for r in noise if r["kind"] == "noise" and r["category"] != "babble"]
+    plain_noise = [r for r in noise if r["kind"] == "noise" and r["category"] != "babble"
+                   and r not in effects]
+    nospeech_kinds = [("music", music), ("noise", plain_noise)]
+    if effects:
+        nospeech_kinds.append(("effects", effects))
+    nospeech_kinds.append(("silence", None))
     rng = random.Random(args.seed * 7919 + ("train", "val", "dev").index(args.part))
-    audio = Audio(args.corpus)
+    audio = Audio()
     os.makedirs(args.out, exist_ok=True)
     with open(os.path.join(args.out, "mixtures.tsv"), "w") as index:
         index.write("name\tkind\tcondition\tlevel_dbfs\tseconds\tbackground\n")
@@ -242,7 +250,7 @@ def main():
                                                 args.label_range_db)
                 meta.update(kind="speech", condition=cond)
                 write(args.out, "%s_speech_%s_%03d" % (args.part, cond, i), mix, lab, meta, index)
-        for kind, pool in (("music", music), ("noise", plain_noise), ("silence", None)):
+        for kind, pool in nospeech_kinds:
             for i in range(args.nospeech_mixtures):
                 mix, lab, meta = nospeech_mixture(audio, pool, args.seconds, kind, rng)
                 meta.update(kind=kind, condition=kind)
