@@ -42,13 +42,12 @@ void QueueReply(Reply reply) { world().replies.push_back(std::move(reply)); }
 using namespace punctuator_double;
 
 extern "C" void* punctuator_init(const char* model_path, const char* vocab_path,
-                                 const char* punc_path, const char* num_path,
-                                 const char* case_path, const char* xdb_path,
-                                 const char* bpe_path, const char* lang) {
-  world().calls.push_back({"punctuator_init",
-                           {model_path, vocab_path, punc_path, num_path, case_path, xdb_path,
-                            bpe_path, lang},
-                           0});
+                                 const char* punc_path, const char* num_path, const char* case_path,
+                                 const char* xdb_path, const char* bpe_path, const char* lang) {
+  world().calls.push_back(
+      {"punctuator_init",
+       {model_path, vocab_path, punc_path, num_path, case_path, xdb_path, bpe_path, lang},
+       0});
   if (world().init_fails) return nullptr;
   // Distinct non-null tokens; never dereferenced.
   void* handle = reinterpret_cast<void*>(world().next_handle++ << 4);

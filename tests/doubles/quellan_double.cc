@@ -44,9 +44,9 @@ extern "C" void* quellan_create(const char* dir) {
   return handle;
 }
 
-extern "C" int quellan_process_wave(void* handle, int index, const int16_t*, int len,
-                                    int16_t* out, int out_capacity, int* out_len, int* speech,
-                                    int* continued, int* ended) {
+extern "C" int quellan_process_wave(void* handle, int index, const int16_t*, int len, int16_t* out,
+                                    int out_capacity, int* out_len, int* speech, int* continued,
+                                    int* ended) {
   world().calls.push_back({"quellan_process_wave", index, len, out_capacity});
   if (!world().handles.count(handle) || world().outputs.empty()) return 0;
   const Output o = std::move(world().outputs.front());

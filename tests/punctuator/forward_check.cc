@@ -41,7 +41,8 @@ int main(int argc, char** argv) {
   const std::string d = std::string(argv[1]) + "/";
   std::string error;
   const auto p = kvasr::punct::Punctuator::Create(
-      {d + "model.bin", d + "vocab.txt", d + "punc.txt", d + "num.txt", d + "case.txt", d + "xdb.txt", d + "bpe.txt"},
+      {d + "model.bin", d + "vocab.txt", d + "punc.txt", d + "num.txt", d + "case.txt",
+       d + "xdb.txt", d + "bpe.txt"},
       "en", &error);
   if (!p) {
     std::cerr << error << "\n";
@@ -86,7 +87,7 @@ int main(int argc, char** argv) {
     compare(r.punct, punct);
     compare(r.casing, casing);
   }
-  std::printf("%zu texts, %d values, largest difference %.2g, %d beyond %.0e\n", references.size(), values, worst,
-              bad, kTolerance);
+  std::printf("%zu texts, %d values, largest difference %.2g, %d beyond %.0e\n", references.size(),
+              values, worst, bad, kTolerance);
   return bad == 0 && values > 0 ? 0 : 1;
 }

@@ -62,8 +62,19 @@ constexpr char kUsage[] =
     "that gives the time of each frame.\n";
 
 enum Option {
-  kModel = 256, kVadModels, kNoVad, kPunct, kPunctSettings, kLang, kJson, kChunkMs,
-  kSilenceBefore, kSilenceAfter, kNoProgress, kVerbose, kHelp
+  kModel = 256,
+  kVadModels,
+  kNoVad,
+  kPunct,
+  kPunctSettings,
+  kLang,
+  kJson,
+  kChunkMs,
+  kSilenceBefore,
+  kSilenceAfter,
+  kNoProgress,
+  kVerbose,
+  kHelp
 };
 
 bool ParseInt(const char* text, long min, long max, long* out) {
@@ -132,7 +143,10 @@ int Transcribe(int argc, char** argv) {
       case kVadModels: o.vad_dir = optarg; break;
       case kNoVad: o.vad = false; break;
       case kPunct: o.punct = true; break;
-      case kPunctSettings: o.punct = true; o.punct_settings = optarg; break;
+      case kPunctSettings:
+        o.punct = true;
+        o.punct_settings = optarg;
+        break;
       case kLang: o.lang = optarg; break;
       case kJson: o.json = true; break;
       case kNoProgress: o.progress = false; break;
@@ -144,10 +158,12 @@ int Transcribe(int argc, char** argv) {
       case kSilenceAfter:
         // The engine counts in 32-bit samples: 16 per millisecond.
         if (!ParseInt(optarg, 0, UINT32_MAX / 16, &n)) {
-          std::fprintf(stderr, "kvasr: silence limits take milliseconds from 0 to %u\n", UINT32_MAX / 16);
+          std::fprintf(stderr, "kvasr: silence limits take milliseconds from 0 to %u\n",
+                       UINT32_MAX / 16);
           return 2;
         }
-        (c == kSilenceBefore ? o.max_silence_before_ms : o.max_silence_after_ms) = static_cast<uint32_t>(n);
+        (c == kSilenceBefore ? o.max_silence_before_ms : o.max_silence_after_ms) =
+            static_cast<uint32_t>(n);
         break;
       case kHelp: std::fputs(kUsage, stdout); return 0;
       default: std::fputs(kUsage, stderr); return 2;
@@ -159,15 +175,14 @@ int Transcribe(int argc, char** argv) {
 
 int Vad(int argc, char** argv) {
   enum VadOption { kVadDir = 256, kVadChunkMs, kFrames, kPlot, kDump, kVadVerbose, kVadHelp };
-  static const struct option kOptions[] = {
-      {"vad-models", required_argument, nullptr, kVadDir},
-      {"chunk-ms", required_argument, nullptr, kVadChunkMs},
-      {"frames", no_argument, nullptr, kFrames},
-      {"plot", required_argument, nullptr, kPlot},
-      {"dump", required_argument, nullptr, kDump},
-      {"verbose", no_argument, nullptr, kVadVerbose},
-      {"help", no_argument, nullptr, kVadHelp},
-      {nullptr, 0, nullptr, 0}};
+  static const struct option kOptions[] = {{"vad-models", required_argument, nullptr, kVadDir},
+                                           {"chunk-ms", required_argument, nullptr, kVadChunkMs},
+                                           {"frames", no_argument, nullptr, kFrames},
+                                           {"plot", required_argument, nullptr, kPlot},
+                                           {"dump", required_argument, nullptr, kDump},
+                                           {"verbose", no_argument, nullptr, kVadVerbose},
+                                           {"help", no_argument, nullptr, kVadHelp},
+                                           {nullptr, 0, nullptr, 0}};
   kvasr_cli::VadOptions o;
   bool verbose = false;
   int c;

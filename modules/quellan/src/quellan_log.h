@@ -21,9 +21,8 @@ constexpr const char* source_path(const char* file) {
 
 }  // namespace quellan
 
-#define QUELLAN_WARN(format, ...)                                             \
-  std::fprintf(stdout, "WARNING * [%s:%d<<%s>>] " format,                    \
-               quellan::source_path(__FILE__), __LINE__, __func__,           \
-               ##__VA_ARGS__)
+#define QUELLAN_WARN(format, ...)                                                         \
+  std::fprintf(stdout, "WARNING * [%s:%d<<%s>>] " format, quellan::source_path(__FILE__), \
+               __LINE__, __func__, ##__VA_ARGS__)
 
 #endif  // QUELLAN_LOG_H_

@@ -45,14 +45,12 @@ int DetectVoicing(VoicingState* s, const float mel_energies[kMelBands]);
 
 // Updates the low/high balance from an unvoiced frame's power spectrum and
 // frame energy. Returns 1 when low frequencies dominate, else 0.
-int DetectRestart(VoicingState* s, int voiced, const float power[kPowerBins],
-                  float energy);
+int DetectRestart(VoicingState* s, int voiced, const float power[kPowerBins], float energy);
 
 // Low-pass filters the newest 80 of the 200 decimated samples (all 200 on the
 // first frame) and writes the last 40 ms at 2 kHz to `out_2khz`. Call after
 // DetectVoicing of the same frame.
-void FilterForPitch(VoicingState* s, int restart,
-                    const float analysis[kAnalysisSamples],
+void FilterForPitch(VoicingState* s, int restart, const float analysis[kAnalysisSamples],
                     float out_2khz[kPitchSamples2kHz]);
 
 #endif  // QUELLAN_VOICING_DETECTOR_H_

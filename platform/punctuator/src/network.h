@@ -48,7 +48,9 @@ class Network {
 
   const NetworkShape& shape() const { return shape_; }
   // Words one Forward call can take.
-  int max_window() const { return static_cast<int>(shape_.window_step + 2 * shape_.window_context); }
+  int max_window() const {
+    return static_cast<int>(shape_.window_step + 2 * shape_.window_context);
+  }
 
   // Logits for `n` <= max_window() words, row-major: punct [n][punct_classes],
   // casing [n][case_classes]. Uses only buffers sized by Load.
