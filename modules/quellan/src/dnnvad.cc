@@ -3,19 +3,10 @@
 #include <algorithm>
 #include <cmath>
 #include <cstring>
-#include <new>
 #include <stdexcept>
 
+#include "alloc_zeroed.h"
 #include "quellan_log.h"
-
-namespace {
-
-template <typename T>
-std::unique_ptr<T[]> alloc_zeroed(size_t count) {
-  return std::unique_ptr<T[]>(new (std::nothrow) T[count]());
-}
-
-}  // namespace
 
 Cdnnvad::Cdnnvad(const VadDnnConf& conf)
     : m_max_frames(conf.max_frames),

@@ -4,9 +4,9 @@
 #include <cmath>
 #include <cstring>
 #include <limits>
-#include <new>
 #include <stdexcept>
 
+#include "alloc_zeroed.h"
 #include "quellan_log.h"
 
 namespace {
@@ -39,14 +39,14 @@ PLP::PLP(const PlpConfig* conf, FILE* cmsfp) {
   }
   build_tables();
   const size_t tgt_floats = static_cast<size_t>(conf_.feat_dim) * conf_.max_frame_num;
-  m_tgt_.reset(new (std::nothrow) float[tgt_floats]());
+  m_tgt_ = alloc_zeroed<float>(tgt_floats);
   if (!m_tgt_) {
     QUELLAN_WARN("Failed to alloc memory for m_tgt, size[%lu]\n",
                  static_cast<unsigned long>(tgt_floats * sizeof(float)));
     throw std::runtime_error("init vad failed");
   }
   const size_t static_floats = static_cast<size_t>(static_dim_) * conf_.max_frame_num;
-  static_buf_.reset(new (std::nothrow) float[static_floats]());
+  static_buf_ = alloc_zeroed<float>(static_floats);
   if (!static_buf_) {
     QUELLAN_WARN("Failed to alloc memory for m_tgt, size[%lu]\n",
                  static_cast<unsigned long>(static_floats * sizeof(float)));

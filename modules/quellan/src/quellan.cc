@@ -3,9 +3,9 @@
 #include <algorithm>
 #include <cstdio>
 #include <cstring>
-#include <new>
 #include <stdexcept>
 
+#include "alloc_zeroed.h"
 #include "quellan_log.h"
 
 namespace {
@@ -14,11 +14,6 @@ namespace {
 // back over the detector's context, a carried closing silence and the head
 // margin: well under a hundred frames with the built-in settings.
 constexpr int kHistoryGuardFrames = 256;
-
-template <typename T>
-std::unique_ptr<T[]> alloc_zeroed(size_t count) {
-  return std::unique_ptr<T[]>(new (std::nothrow) T[count]());
-}
 
 }  // namespace
 
