@@ -4,7 +4,6 @@
 #include <cmath>
 #include <cstring>
 #include <limits>
-#include <stdexcept>
 
 #include "alloc_zeroed.h"
 #include "quellan_log.h"
@@ -33,24 +32,19 @@ float clip_static(float v) {
 }  // namespace
 
 PLP::PLP(const PlpConfig* conf, FILE* cmsfp) {
-  if (load_base_info_cmsfp(this, conf, cmsfp) != 0) {
-    QUELLAN_WARN("Failed to load base info\n");
-    throw std::runtime_error("init vad failed");
-  }
+  if (load_base_info_cmsfp(this, conf, cmsfp) != 0) QUELLAN_INIT_FAIL("Failed to load base info\n");
   build_tables();
   const size_t tgt_floats = static_cast<size_t>(conf_.feat_dim) * conf_.max_frame_num;
   m_tgt_ = alloc_zeroed<float>(tgt_floats);
   if (!m_tgt_) {
-    QUELLAN_WARN("Failed to alloc memory for m_tgt, size[%lu]\n",
-                 static_cast<unsigned long>(tgt_floats * sizeof(float)));
-    throw std::runtime_error("init vad failed");
+    QUELLAN_INIT_FAIL("Failed to alloc memory for m_tgt, size[%lu]\n",
+                      static_cast<unsigned long>(tgt_floats * sizeof(float)));
   }
   const size_t static_floats = static_cast<size_t>(static_dim_) * conf_.max_frame_num;
   static_buf_ = alloc_zeroed<float>(static_floats);
   if (!static_buf_) {
-    QUELLAN_WARN("Failed to alloc memory for m_tgt, size[%lu]\n",
-                 static_cast<unsigned long>(static_floats * sizeof(float)));
-    throw std::runtime_error("init vad failed");
+    QUELLAN_INIT_FAIL("Failed to alloc memory for m_tgt, size[%lu]\n",
+                      static_cast<unsigned long>(static_floats * sizeof(float)));
   }
 }
 
