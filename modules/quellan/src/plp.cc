@@ -43,6 +43,7 @@ PLP::PLP(const PlpConfig* conf, FILE* cmsfp) {
   const size_t static_floats = static_cast<size_t>(static_dim_) * conf_.max_frame_num;
   static_buf_ = alloc_zeroed<float>(static_floats);
   if (!static_buf_) {
+    // compat: names m_tgt, as this message always has; hosts match the text.
     QUELLAN_INIT_FAIL("Failed to alloc memory for m_tgt, size[%lu]\n",
                       static_cast<unsigned long>(static_floats * sizeof(float)));
   }

@@ -33,7 +33,7 @@ Cquellan::Cquellan(const QuellanConf& conf)
   m_wav_history = alloc_zeroed<int16_t>(static_cast<size_t>(m_history_capacity));
   wav_reserve = alloc_zeroed<int16_t>(static_cast<size_t>(m_wav_capacity));
   if (!m_wav_history || !wav_reserve) {
-    // Established wording, although it names another object.
+    // compat: established wording, though it names another object; hosts match the text.
     QUELLAN_INIT_FAIL("failed to new Vortaf0Interface.\n");
   }
   FILE* cmsfp = nullptr;
@@ -229,6 +229,7 @@ int Cquellan::quellan_process(int index, const int16_t* samples, int len, int16_
                               int* ended) {
   if (samples == nullptr || out == nullptr || len < 0 || out_capacity < 0 || out_len == nullptr ||
       speech == nullptr || continued == nullptr || ended == nullptr) {
+    // compat: "Invalide" is the established spelling of this message; hosts match the text.
     QUELLAN_WARN("Invalide input arguments.\n");
     return 0;
   }
@@ -269,8 +270,7 @@ int Cquellan::quellan_process(int index, const int16_t* samples, int len, int16_
 
   for (int i = 1; i < m_seg_num; ++i) m_seg_beg[i] = m_seg_end[i - 1] + 1;
 
-  // A call that completes no frame leaves the lists as they were, so it
-  // reports the previous call's intervals once more.
+  // compat: a call that completes no frame reports the previous call's intervals once more.
   *out_len = 0;
   *speech = 0;
   *continued = 0;

@@ -324,6 +324,7 @@ int set_vaddnn_feature(VadDnn* dnn, const float* feat, int feat_dim, int t0, int
                        int total, int skip, int* rows) {
   if (dnn == nullptr || feat == nullptr || rows == nullptr || feat_dim < 1 || total < 1 ||
       skip < 0 || dnn->input_buffer == nullptr) {
+    // compat: "Invalide" is the established spelling of this message; hosts match the text.
     QUELLAN_WARN("Invalide input arguments.\n");
     return -1;
   }
@@ -357,6 +358,7 @@ int set_vaddnn_feature(VadDnn* dnn, const float* feat, int feat_dim, int t0, int
 int calc_vaddnn_prob(VadDnn* dnn, int rows, float* score) {
   if (dnn == nullptr || rows <= 0 || score == nullptr || rows > dnn->max_frames ||
       dnn->input_buffer == nullptr || dnn->state_weights == nullptr) {
+    // compat: "Invalide" is the established spelling of this message; hosts match the text.
     QUELLAN_WARN("Invalide input arguments.\n");
     return -1;
   }
