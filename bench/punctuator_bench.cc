@@ -20,9 +20,10 @@ const char kWords[] =
 void* Open() {
   const char* other = std::getenv("KVASR_PUNCT_BENCH_MODEL");
   const std::string d = std::string(other ? other : KVASR_PUNCT_MODEL_DIR) + "/";
-  return punctuator_init((d + "model.bin").c_str(), (d + "vocab.txt").c_str(), (d + "punc.txt").c_str(),
-                         (d + "num.txt").c_str(), (d + "case.txt").c_str(), (d + "xdb.txt").c_str(),
-                         (d + "bpe.txt").c_str(), "en");
+  return punctuator_init((d + "model.bin").c_str(), (d + "vocab.txt").c_str(),
+                         (d + "punc.txt").c_str(), (d + "num.txt").c_str(),
+                         (d + "case.txt").c_str(), (d + "xdb.txt").c_str(), (d + "bpe.txt").c_str(),
+                         "en");
 }
 
 void BM_Punctuate(benchmark::State& state) {
@@ -39,7 +40,8 @@ void BM_Punctuate(benchmark::State& state) {
     p = *e ? e + 1 : e;
   }
   std::string text;
-  for (int64_t i = 0; i < state.range(0); ++i) text += words[static_cast<size_t>(i) % words.size()] + " ";
+  for (int64_t i = 0; i < state.range(0); ++i)
+    text += words[static_cast<size_t>(i) % words.size()] + " ";
   std::vector<char> out(1 << 20);
   // Alternate two texts so the library's cache of the last text never
   // answers.

@@ -5,12 +5,12 @@
 #include <benchmark/benchmark.h>
 #include <sndfile.h>
 
+#include <unistd.h>
 #include <cmath>
 #include <cstdio>
 #include <memory>
 #include <random>
 #include <string>
-#include <unistd.h>
 #include <vector>
 
 #include "plp.h"
@@ -93,9 +93,8 @@ void BM_DetectorMemory(benchmark::State& state) {
       const int len = static_cast<int>(std::min<size_t>(1600, audio.size() - pos));
       ++index;
       int out_len = 0, speech = 0, continued = 0, ended = 0;
-      quellan_process_wave(handle, pos + len == audio.size() ? -index : index,
-                           audio.data() + pos, len, out.data(),
-                           static_cast<int>(out.size()), &out_len, &speech,
+      quellan_process_wave(handle, pos + len == audio.size() ? -index : index, audio.data() + pos,
+                           len, out.data(), static_cast<int>(out.size()), &out_len, &speech,
                            &continued, &ended);
     }
     state.counters["resident_KiB"] = static_cast<double>(ResidentKiB() - before);
@@ -115,8 +114,8 @@ void BM_Plp(benchmark::State& state) {
   for (auto _ : state) {
     plp.reset();
     int frames = 0;
-    plp.extract_feature(audio.data(), static_cast<int>(audio.size()), rows.data(),
-                        kMaxFrames, &frames, -2);
+    plp.extract_feature(audio.data(), static_cast<int>(audio.size()), rows.data(), kMaxFrames,
+                        &frames, -2);
     benchmark::DoNotOptimize(rows.data());
   }
   SetRtf(state, AudioSeconds());
@@ -127,8 +126,7 @@ BENCHMARK(BM_Plp)->Unit(benchmark::kMillisecond);
 void BM_Network(benchmark::State& state) {
   const QuellanConf conf = Conf();
   VadDnn* dnn = load_vaddnn_file(conf.vad.dnn_file);
-  if (dnn == nullptr ||
-      set_vaddnn_params(dnn, kMaxFrames, kContextFrames, kContextFrames) != 0 ||
+  if (dnn == nullptr || set_vaddnn_params(dnn, kMaxFrames, kContextFrames, kContextFrames) != 0 ||
       load_vaddnn_state_weights(dnn, conf.vad.state_weights_file) != 0) {
     state.SkipWithError("cannot load the shipped network");
     return;
@@ -139,8 +137,8 @@ void BM_Network(benchmark::State& state) {
   std::vector<float> rows(kFramesPerSecond * kFeatDim);
   for (float& v : rows) v = normal(rng);
   int spliced = 0;
-  set_vaddnn_feature(dnn, rows.data(), kFeatDim, 0, 0, kFramesPerSecond - 1,
-                     kFramesPerSecond, kSkipFrames, &spliced);
+  set_vaddnn_feature(dnn, rows.data(), kFeatDim, 0, 0, kFramesPerSecond - 1, kFramesPerSecond,
+                     kSkipFrames, &spliced);
   std::vector<float> scores(spliced);
   for (auto _ : state) {
     benchmark::DoNotOptimize(calc_vaddnn_prob(dnn, spliced, scores.data()));
@@ -164,8 +162,7 @@ void BM_Pipeline(benchmark::State& state) {
       const bool last = pos + len == audio.size();
       int out_len = 0, speech = 0, continued = 0, ended = 0;
       pipe.quellan_process(last ? -index : index, audio.data() + pos, len, out.data(),
-                           static_cast<int>(out.size()), &out_len, &speech,
-                           &continued, &ended);
+                           static_cast<int>(out.size()), &out_len, &speech, &continued, &ended);
       benchmark::DoNotOptimize(out_len);
     }
   }

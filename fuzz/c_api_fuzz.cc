@@ -34,8 +34,8 @@ struct Slot {
 
 struct Fixtures {
   std::string decoder_model;
-  std::string speech_models;   // every frame above the energy gate is speech
-  std::string silent_models;   // nothing is speech
+  std::string speech_models;  // every frame above the energy gate is speech
+  std::string silent_models;  // nothing is speech
 };
 
 const Fixtures& fixtures() {
@@ -78,19 +78,17 @@ std::string InitParams(FuzzedDataProvider& in) {
       return "{" + decoder + R"("local_vad_model_dir_path":")" + f.speech_models +
              R"(","lang":"en","vad_enabled":true,"local_punc_settings":{"model_path":"p",)"
              R"("punc_all":true}})";
-    case 4:
-      return "{" + decoder + R"("lang":"en","vad_enabled":true})";
-    default:
-      return in.ConsumeRandomLengthString(300);
+    case 4: return "{" + decoder + R"("lang":"en","vad_enabled":true})";
+    default: return in.ConsumeRandomLengthString(300);
   }
 }
 
 std::string StartParams(FuzzedDataProvider& in) {
   if (in.ConsumeBool()) return in.ConsumeRandomLengthString(100);
-  const int before = in.ConsumeBool() ? in.ConsumeIntegralInRange(0, 6000)
-                                      : in.ConsumeIntegral<int32_t>();
-  const int after = in.ConsumeBool() ? in.ConsumeIntegralInRange(0, 6000)
-                                     : in.ConsumeIntegral<int32_t>();
+  const int before =
+      in.ConsumeBool() ? in.ConsumeIntegralInRange(0, 6000) : in.ConsumeIntegral<int32_t>();
+  const int after =
+      in.ConsumeBool() ? in.ConsumeIntegralInRange(0, 6000) : in.ConsumeIntegral<int32_t>();
   return R"({"asr":{"max_mute_time_before_voice":)" + std::to_string(before) +
          R"(,"max_mute_time_after_voice":)" + std::to_string(after) + "}}";
 }
@@ -148,12 +146,8 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
             packet);
         break;
       }
-      case 5:
-        vorta_speech_offline_asr_stop(engine);
-        break;
-      case 6:
-        vorta_speech_offline_asr_close(engine);
-        break;
+      case 5: vorta_speech_offline_asr_stop(engine); break;
+      case 6: vorta_speech_offline_asr_close(engine); break;
       case 7:
         vorta_speech_release_offline_asr_engine(engine);
         slot = Slot();
@@ -169,8 +163,8 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
         // are passed on byte for byte, so only valid UTF-8 can come out as
         // valid JSON: the pieces cover quoting, control characters and
         // multi-byte characters.
-        static const char* const kPieces[] = {"word", " ", "\"", "\\", "\n", "\x01",
-                                              "\x7f", "\xc3\xa9", "\xe0\xb8\xaa", "/", "{}"};
+        static const char* const kPieces[] = {
+            "word", " ", "\"", "\\", "\n", "\x01", "\x7f", "\xc3\xa9", "\xe0\xb8\xaa", "/", "{}"};
         std::string text;
         for (int n = in.ConsumeIntegralInRange(0, 8); n > 0; --n) {
           text += kPieces[in.ConsumeIntegralInRange<size_t>(0, std::size(kPieces) - 1)];

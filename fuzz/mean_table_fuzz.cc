@@ -21,8 +21,8 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
   plp_set_defaults(&conf, kFrames, nullptr);
   // fmemopen refuses an empty buffer; an empty file is still a case.
   static char empty_byte = 0;
-  FILE* table = size > 0 ? fmemopen(const_cast<uint8_t*>(data), size, "rb")
-                         : fmemopen(&empty_byte, 1, "rb");
+  FILE* table =
+      size > 0 ? fmemopen(const_cast<uint8_t*>(data), size, "rb") : fmemopen(&empty_byte, 1, "rb");
   if (table == nullptr) std::abort();
   if (size == 0) std::fgetc(table);
   try {

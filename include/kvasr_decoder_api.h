@@ -22,8 +22,7 @@ extern "C" {
  * only; `flag` > 0 marks the final text of the utterance, 0 a partial one.
  * `score` is the decoder's confidence (the library documents its unit).
  * `out_handle` is the value given to mwSetOutHandle. */
-typedef void (*mw_result_callback)(const char* text, float score, int flag,
-                                   void* out_handle);
+typedef void (*mw_result_callback)(const char* text, float score, int flag, void* out_handle);
 
 /* The decoder's own detector saw speech end. `reason` is library-defined. */
 typedef void (*mw_speech_end_callback)(int reason, void* out_handle);

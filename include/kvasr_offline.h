@@ -30,9 +30,7 @@ extern "C" {
  * pointer given to start. Runs on the caller's thread, inside the
  * process_sound_data, stop or close call that produced the result.
  */
-typedef void (*vorta_speech_result_callback)(void* engine,
-                                             const char* result_json,
-                                             void* context);
+typedef void (*vorta_speech_result_callback)(void* engine, const char* result_json, void* context);
 
 /* Version text of the decoder library. Needs no engine; the text stays valid
  * until the process ends. */
@@ -57,8 +55,7 @@ KVASR_API int vorta_speech_offline_asr_init(void* engine, const char* params);
  * handed back unchanged. Returns 0, or -1 on a null engine or text, bad
  * parameters or an engine that is not initialised. */
 KVASR_API int vorta_speech_offline_asr_start(void* engine, const char* params,
-                                             vorta_speech_result_callback callback,
-                                             void* context);
+                                             vorta_speech_result_callback callback, void* context);
 
 /* Ends the listening period; a final result may reach the callback during the
  * call. Returns 0, or -1 on a null engine. */
@@ -76,8 +73,7 @@ KVASR_API void vorta_speech_offline_asr_close(void* engine);
  * the last chunk of an utterance. Returns 0, or -1 on a null engine, null
  * samples, count <= 0, an engine that is not started, a decoder error, or a
  * silence time-out (which also ends the listening period). */
-KVASR_API int vorta_speech_offline_asr_process_sound_data(void* engine,
-                                                          const int16_t* samples,
+KVASR_API int vorta_speech_offline_asr_process_sound_data(void* engine, const int16_t* samples,
                                                           int count, int packet);
 
 #ifdef __cplusplus

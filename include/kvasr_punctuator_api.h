@@ -17,9 +17,8 @@ extern "C" {
 /* Loads a model from seven files (an empty string stands for a file the model
  * does not use) for a two-letter language code. All strings are read during
  * the call only. Returns null on failure, with a line on standard error. */
-void* punctuator_init(const char* model_path, const char* vocab_path,
-                      const char* punc_path, const char* num_path,
-                      const char* case_path, const char* xdb_path,
+void* punctuator_init(const char* model_path, const char* vocab_path, const char* punc_path,
+                      const char* num_path, const char* case_path, const char* xdb_path,
                       const char* bpe_path, const char* lang);
 
 /* Punctuates the NUL-terminated `text` into `out`, whose capacity in bytes is
@@ -30,6 +29,7 @@ void* punctuator_init(const char* model_path, const char* vocab_path,
 int punctuator_do_it(void* handle, const char* text, char* out, int32_t* size);
 
 /* Frees the handle. Null: no-op. */
+/* compat: the established spelling of an exported name; renaming it breaks every host. */
 void punctuator_relese(void* handle);
 
 #ifdef __cplusplus

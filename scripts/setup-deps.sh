@@ -6,7 +6,7 @@ set -euo pipefail
 packages=(
   build-essential cmake pkg-config
   clang llvm libclang-rt-dev
-  googletest libgtest-dev libgmock-dev libbenchmark-dev
+  googletest libgtest-dev libgmock-dev libbenchmark-dev clang-format
   libcpprest-dev
   libsndfile1-dev libsamplerate0-dev
   libpocketsphinx-dev pocketsphinx-en-us pocketsphinx-testdata

@@ -1,5 +1,6 @@
 #!/usr/bin/env bash
-# Sets up the machine and runs every check: the test suite in a plain build
+# Sets up the machine and runs every check: the formatting of every tracked
+# C and C++ file, the test suite in a plain build
 # (warnings as errors), each fuzz target for a bounded time, the four-engine
 # test under ThreadSanitizer, and the test suite again under
 # AddressSanitizer + UndefinedBehaviorSanitizer.
@@ -9,6 +10,9 @@ cd "$(dirname "$0")/.."
 bash scripts/setup-deps.sh
 
 jobs=$(nproc)
+
+echo "== formatting (.clang-format)"
+git ls-files -z '*.c' '*.cc' '*.cpp' '*.h' '*.hpp' | xargs -0 clang-format --dry-run --Werror
 
 echo "== plain build"
 cmake -S . -B build -DCMAKE_BUILD_TYPE=RelWithDebInfo -DKVASR_WERROR=ON

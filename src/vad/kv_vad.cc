@@ -1,10 +1,10 @@
 #include "vad/kv_vad.h"
 
+#include <algorithm>
+#include <climits>
 #include <cstdio>
 #include <cstdlib>
 #include <exception>
-#include <algorithm>
-#include <climits>
 #include <iostream>
 
 #include "quellan_wrap.h"
@@ -91,12 +91,12 @@ void Vad::ProcessIn(const uint16_t* data, size_t len, bool end) {
                        static_cast<int>(len), reinterpret_cast<int16_t*>(seg.data() + old),
                        static_cast<int>(capacity), &out_len, &speech, &continued, &ended);
   // A module that reports more than it was given room for is not trusted.
-  const size_t emitted = (out_len > 0 && static_cast<size_t>(out_len) <= capacity)
-                             ? static_cast<size_t>(out_len) : 0;
+  const size_t emitted =
+      (out_len > 0 && static_cast<size_t>(out_len) <= capacity) ? static_cast<size_t>(out_len) : 0;
   seg.resize(old + emitted);
 
-  // The order of these tests decides when a segment closes: one that opens
-  // and ends within a call stays open until the next call that ends it.
+  // The order of these tests decides when a segment closes.
+  // compat: a segment that opens and ends in one call stays open until a later call ends it.
   if (m_in_speech) {
     if (ended == 0 && !end) return;
     OpenSegment();

@@ -79,7 +79,10 @@ TEST_F(DecoderManifest, EachFaultIsRejectedWithItsReason) {
     const char* fragment;
   } cases[] = {
       {"", "empty file"},
-      {std::string("\x7f" "ELF\0\0\x01", 7), "not a text file"},
+      {std::string("\x7f"
+                   "ELF\0\0\x01",
+                   7),
+       "not a text file"},
       {"hello world\n", "first line must be"},
       {"kvasr-decoder-manifesto 1\n" + kAcousticModel, "first line must be"},
       {"kvasr-decoder-manifest 2\n" + kAcousticModel, "unsupported format version \"2\""},
@@ -103,7 +106,8 @@ TEST_F(DecoderManifest, EachFaultIsRejectedWithItsReason) {
       {kTag + std::string(70 * 1024, '#'), "larger than"},
       // A readable file that is no language model.
       {kTag + kAcousticModel + kDictionary + "language_model = " + kModelDir +
-           "/cmudict-en-us.dict\n", "could not load the model"},
+           "/cmudict-en-us.dict\n",
+       "could not load the model"},
   };
   for (const auto& c : cases) {
     SCOPED_TRACE(c.fragment);
@@ -120,9 +124,9 @@ TEST_F(DecoderManifest, RelativePathsAreTakenFromTheManifestsOwnFolder) {
   for (const char* name : {"en-us", "cmudict-en-us.dict", "en-us.lm.bin"}) {
     fs::create_symlink(kModelDir + "/" + name, dir_ / name);
   }
-  const fs::path manifest = Write(
-      kTag + "acoustic_model = en-us\ndictionary = cmudict-en-us.dict\n"
-             "language_model = ./en-us.lm.bin\n");
+  const fs::path manifest = Write(kTag +
+                                  "acoustic_model = en-us\ndictionary = cmudict-en-us.dict\n"
+                                  "language_model = ./en-us.lm.bin\n");
   const fs::path previous_dir = fs::current_path();
   fs::current_path("/");
   const InitOutcome outcome = InitFromPath(manifest);

@@ -82,7 +82,7 @@ TEST_F(DecoderStream, EveryUtteranceEndsInOneFinalOfItsOwnWords) {
   Session session;
   EXPECT_EQ(session.Stop(), 0);  // no utterance yet: nothing
   session.Feed(clip_, kChunkSamples, true);
-  EXPECT_EQ(session.Stop(), 0);  // the last chunk already ended it
+  EXPECT_EQ(session.Stop(), 0);                    // the last chunk already ended it
   session.Feed(other_clip_, kChunkSamples, true);  // data alone opens the next
   session.Feed(other_clip_);
   ASSERT_EQ(mwStartDecode(session.handle()), 0);  // drops the unfinished one
@@ -202,8 +202,8 @@ TEST(DecoderCalls, NullHandlesAndOutOfRangeArgumentsAreRefused) {
 }
 
 TEST_F(DecoderStream, CallsFromInsideACallbackAreRefused) {
-  for (auto reentry : {Session::Reentry::kFeed, Session::Reentry::kStop,
-                       Session::Reentry::kStart}) {
+  for (auto reentry :
+       {Session::Reentry::kFeed, Session::Reentry::kStop, Session::Reentry::kStart}) {
     Session session;
     session.set_reentry(reentry);
     session.Feed(clip_, kChunkSamples, true);

@@ -62,17 +62,12 @@ int Session::Stop() { return mwStopDecode(handle_); }
 void Session::Record(Session* session, Event event) {
   const int16_t silence[kChunkSamples] = {};
   switch (session->reentry_) {
-    case Reentry::kNone:
-      break;
+    case Reentry::kNone: break;
     case Reentry::kFeed:
       event.reentry_result = mwSetData(session->handle_, silence, kChunkSamples, 0);
       break;
-    case Reentry::kStop:
-      event.reentry_result = mwStopDecode(session->handle_);
-      break;
-    case Reentry::kStart:
-      event.reentry_result = mwStartDecode(session->handle_);
-      break;
+    case Reentry::kStop: event.reentry_result = mwStopDecode(session->handle_); break;
+    case Reentry::kStart: event.reentry_result = mwStartDecode(session->handle_); break;
     case Reentry::kDestroy:
       mwDecoderDestroy(session->handle_);
       session->handle_ = nullptr;

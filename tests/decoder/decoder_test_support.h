@@ -19,7 +19,7 @@ constexpr int64_t kChunkSamples = 100 * kSamplesPerMs;
 using kvasr_test::LibrivoxClip;
 
 struct Event {
-  bool is_result;      // else speech end
+  bool is_result;  // else speech end
   std::string text;
   float score;
   int flag_or_reason;

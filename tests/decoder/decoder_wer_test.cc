@@ -51,16 +51,14 @@ TEST(DecoderAccuracy, LibrivoxWordErrorRateStaysWithinBound) {
     total_errors += errors;
     total_words += reference.words.size();
     std::cout << "clip " << reference.id << ": WER " << std::fixed << std::setprecision(3)
-              << static_cast<double>(errors) / static_cast<double>(reference.words.size())
-              << " (" << errors << "/" << reference.words.size() << ")  \"" << finals.back().text
-              << "\"\n";
+              << static_cast<double>(errors) / static_cast<double>(reference.words.size()) << " ("
+              << errors << "/" << reference.words.size() << ")  \"" << finals.back().text << "\"\n";
   }
   ASSERT_EQ(session.Finals().size(), references.size());
   const double wer = static_cast<double>(total_errors) / static_cast<double>(total_words);
-  std::cout << "overall: WER " << std::fixed << std::setprecision(3) << wer << " ("
-            << total_errors << "/" << total_words << "), " << audio_seconds
-            << " s audio in " << cpu_seconds << " s CPU, real-time factor "
-            << audio_seconds / cpu_seconds << " (audio s / CPU s)\n";
+  std::cout << "overall: WER " << std::fixed << std::setprecision(3) << wer << " (" << total_errors
+            << "/" << total_words << "), " << audio_seconds << " s audio in " << cpu_seconds
+            << " s CPU, real-time factor " << audio_seconds / cpu_seconds << " (audio s / CPU s)\n";
   RecordProperty("wer_permille", static_cast<int>(wer * 1000 + 0.5));
   RecordProperty("realtime_factor_x100", static_cast<int>(audio_seconds / cpu_seconds * 100));
   EXPECT_LE(wer, kMaxOverallWer);

@@ -11,9 +11,9 @@ namespace decoder_double {
 
 struct Call {
   std::string name;
-  std::vector<int64_t> args;      // integer arguments in order (handle excluded)
-  std::vector<int16_t> samples;   // mwSetData only
-  std::string model;              // mwDecoderInit only: the file's content
+  std::vector<int64_t> args;     // integer arguments in order (handle excluded)
+  std::vector<int16_t> samples;  // mwSetData only
+  std::string model;             // mwDecoderInit only: the file's content
 };
 
 // A callback to fire from inside a call.

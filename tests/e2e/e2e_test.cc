@@ -39,10 +39,10 @@ class EndToEnd : public testing::Test {
   // Word error rate over the five recordings with the shipped models, one
   // listening period each.
   double WordErrorRate(bool vad) {
-    const std::string params = std::string("{\"local_moxwing_model_file_path\":\"") +
-                               KVASR_DECODER_MANIFEST + "\",\"local_vad_model_dir_path\":\"" +
-                               KVASR_VAD_MODEL_DIR + "\",\"lang\":\"en-US\",\"vad_enabled\":" +
-                               (vad ? "true" : "false") + "}";
+    const std::string params =
+        std::string("{\"local_moxwing_model_file_path\":\"") + KVASR_DECODER_MANIFEST +
+        "\",\"local_vad_model_dir_path\":\"" + KVASR_VAD_MODEL_DIR +
+        "\",\"lang\":\"en-US\",\"vad_enabled\":" + (vad ? "true" : "false") + "}";
     EXPECT_EQ(vorta_speech_offline_asr_init(engine_, params.c_str()), 0);
     const char* label = vad ? "with VAD" : "without VAD";
     size_t errors = 0;
@@ -52,8 +52,8 @@ class EndToEnd : public testing::Test {
     for (const kvasr_test::LibrivoxReference& reference : references) {
       const std::vector<int16_t> samples = kvasr_test::LibrivoxClip(reference.id);
       std::string hypothesis;
-      EXPECT_EQ(
-          vorta_speech_offline_asr_start(engine_, "{\"asr\":{}}", CollectFinals, &hypothesis), 0);
+      EXPECT_EQ(vorta_speech_offline_asr_start(engine_, "{\"asr\":{}}", CollectFinals, &hypothesis),
+                0);
       for (size_t at = 0; at < samples.size(); at += kChunkSamples) {
         const size_t n = std::min<size_t>(kChunkSamples, samples.size() - at);
         const int packet = at + n == samples.size() ? -1 : 0;
@@ -64,8 +64,8 @@ class EndToEnd : public testing::Test {
       }
       vorta_speech_offline_asr_stop(engine_);
       const size_t e = kvasr_test::EditDistance(reference.words, kvasr_test::Words(hypothesis));
-      std::fprintf(stderr, "%s, clip %s: %zu errors / %zu words: %s\n", label,
-                   reference.id.c_str(), e, reference.words.size(), hypothesis.c_str());
+      std::fprintf(stderr, "%s, clip %s: %zu errors / %zu words: %s\n", label, reference.id.c_str(),
+                   e, reference.words.size(), hypothesis.c_str());
       errors += e;
       reference_words += reference.words.size();
     }

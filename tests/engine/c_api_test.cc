@@ -29,11 +29,14 @@ class CApiTest : public testing::Test {
     g_received.clear();
     engine_ = vorta_speech_create_offline_asr_engine();
   }
-  void TearDown() override { Stdout([&] { vorta_speech_release_offline_asr_engine(engine_); }); }
+  void TearDown() override {
+    Stdout([&] { vorta_speech_release_offline_asr_engine(engine_); });
+  }
 
   void InitAndStart(vorta_speech_result_callback callback) {
     const std::string params = R"({"local_vad_model_dir_path":"unused","lang":"en",)"
-                               R"("local_moxwing_model_file_path":")" + model_.path() + "\"}";
+                               R"("local_moxwing_model_file_path":")" +
+                               model_.path() + "\"}";
     Stdout([&] {
       ASSERT_EQ(vorta_speech_offline_asr_init(engine_, params.c_str()), 0);
       ASSERT_EQ(vorta_speech_offline_asr_start(engine_, R"({"asr":{}})", callback, &context_), 0);

@@ -50,9 +50,9 @@ class EngineTest : public testing::Test {
 
   std::string Start(const std::string& params, bool ok, void* context = nullptr) {
     return Stdout([&] {
-      EXPECT_EQ(engine_.AsrStart(params, context, [this](std::string m) {
-        messages_.push_back(std::move(m));
-      }), ok);
+      EXPECT_EQ(engine_.AsrStart(params, context,
+                                 [this](std::string m) { messages_.push_back(std::move(m)); }),
+                ok);
     });
   }
 
@@ -95,12 +95,9 @@ TEST_F(EngineTest, InitCreatesTheDecoderAndOnlyTheBackEndsAskedFor) {
   };
   const std::string punctuation = R"(,"local_punc_settings":{})";
   const Case cases[] = {
-      {"", "en-US", false, false},
-      {R"(,"vad_enabled":"yes")", "en-US", false, false},
-      {kVad, "en-US", true, false},
-      {R"(,"local_punc_settings":"m")", "en", false, false},
-      {punctuation, "th", false, false},
-      {punctuation, "th-TH", false, false},
+      {"", "en-US", false, false},       {R"(,"vad_enabled":"yes")", "en-US", false, false},
+      {kVad, "en-US", true, false},      {R"(,"local_punc_settings":"m")", "en", false, false},
+      {punctuation, "th", false, false}, {punctuation, "th-TH", false, false},
       {punctuation, "t", false, true},  // a one-letter language is compared whole
   };
   for (const Case& c : cases) {
@@ -169,7 +166,7 @@ TEST_F(EngineTest, DecoderRefusalKeepsTheFailedBackEndsUntilAnotherInit) {
                       "OfflineAsrEngineImpl->asr init exception:init local asr failed\n"),
             std::string::npos);
   EXPECT_EQ(decoder_double::Count("mwSetOnResult"), 0);  // nothing configured on no decoder
-  Stdout([&] { engine_.Close(); });  // state 0: nothing happens
+  Stdout([&] { engine_.Close(); });                      // state 0: nothing happens
   EXPECT_TRUE(engine_.has_decoder() && engine_.has_vad());
   decoder_double::SetInitFails(false);
   Init(engine_, InitParams(), true);
@@ -177,8 +174,9 @@ TEST_F(EngineTest, DecoderRefusalKeepsTheFailedBackEndsUntilAnotherInit) {
 }
 
 TEST_F(EngineTest, PunctuationSettingsAreReadKeyByKey) {
-  Init(engine_, InitParams(R"(,"local_punc_settings":{"model_path":"m","vocab_path":5,)"
-                           R"("punc_path":"p","case_path":"c","xdb_path":"x","bpe_path":"b"})"),
+  Init(engine_,
+       InitParams(R"(,"local_punc_settings":{"model_path":"m","vocab_path":5,)"
+                  R"("punc_path":"p","case_path":"c","xdb_path":"x","bpe_path":"b"})"),
        true);
   ASSERT_TRUE(engine_.has_punctuator());
   EXPECT_EQ(punctuator_double::Calls()[0].strings,
@@ -299,14 +297,15 @@ TEST_F(EngineTest, ResultsBecomeCompactSortedJsonWithValidUtf8) {
   Started("");
   Decode({Result("abc", 1)});
   EXPECT_EQ(messages_, Messages{kResultFinalAbc});
-  const std::pair<std::string, std::string> cases[] = {  // text, as it appears in the JSON
+  const std::pair<std::string, std::string> cases[] = {
+      // text, as it appears in the JSON
       {"say \"hi\" \\ ok", R"(say \"hi\" \\ ok)"},
       {"na\xc3\xafve", "na\xc3\xafve"},
       {"\xF0\x9F\x98\x80 ok", "\xF0\x9F\x98\x80 ok"},
-      {"a\xff b", "a\xEF\xBF\xBD b"},                               // stray byte
-      {"\xC0\xAF", "\xEF\xBF\xBD\xEF\xBF\xBD"},                    // overlong slash
+      {"a\xff b", "a\xEF\xBF\xBD b"},                            // stray byte
+      {"\xC0\xAF", "\xEF\xBF\xBD\xEF\xBF\xBD"},                  // overlong slash
       {"\xED\xA0\x80", "\xEF\xBF\xBD\xEF\xBF\xBD\xEF\xBF\xBD"},  // surrogate
-      {"end\xE2\x82", "end\xEF\xBF\xBD\xEF\xBF\xBD"},               // cut short
+      {"end\xE2\x82", "end\xEF\xBF\xBD\xEF\xBF\xBD"},            // cut short
   };
   for (const auto& c : cases) {
     SCOPED_TRACE(c.first);
@@ -344,10 +343,10 @@ TEST_F(EngineTest, SpeechSegmentsReachTheDecoderAndCompletedOnesAreMarkedLast) {
   Feed(1, 160, -1);  // without speech, yet the decoder must see the end
   EXPECT_EQ(quellan_double::Calls().back().index, -4);
   // Each completed segment restarts the decoder.
-  ASSERT_EQ(decoder_double::CallNames(),
-            (std::vector<std::string>{"mwSetData", "mwSetData", "mwSetData", "mwStopDecode",
-                                      "mwStartDecode", "mwSetData", "mwStopDecode",
-                                      "mwStartDecode"}));
+  ASSERT_EQ(
+      decoder_double::CallNames(),
+      (std::vector<std::string>{"mwSetData", "mwSetData", "mwSetData", "mwStopDecode",
+                                "mwStartDecode", "mwSetData", "mwStopDecode", "mwStartDecode"}));
   const auto& calls = decoder_double::Calls();
   EXPECT_EQ(calls[0].args, (std::vector<int64_t>{0, 0}));
   EXPECT_EQ(calls[1].samples, (std::vector<int16_t>{10, 11}));

@@ -42,9 +42,9 @@ TEST_F(MoxwingTest, InitConfiguresOneDecoderInOrder) {
   Moxwing m(model_.path(), "en");
   ASSERT_TRUE(m.Init());
   const auto& calls = decoder_double::Calls();
-  ASSERT_EQ(CallNames(), (Names{"mwDecoderInit", "mwSetVadEnabled", "mwSetAutoStopEnabled",
-                                "mwSetVadThreshold", "mwSetOutHandle", "mwSetOnSpeechEnd",
-                                "mwSetOnResult"}));
+  ASSERT_EQ(CallNames(),
+            (Names{"mwDecoderInit", "mwSetVadEnabled", "mwSetAutoStopEnabled", "mwSetVadThreshold",
+                   "mwSetOutHandle", "mwSetOnSpeechEnd", "mwSetOnResult"}));
   EXPECT_EQ(calls[0].model, "model-bytes");
   EXPECT_EQ(calls[0].args, (std::vector<int64_t>{0, 1}));
   EXPECT_EQ(calls[1].args, (std::vector<int64_t>{1}));
@@ -118,15 +118,15 @@ TEST_F(MoxwingTest, ResultsSkipEmptyTextsAndFinalsFollowTheFlag) {
   EXPECT_EQ(Stdout([&] { ASSERT_TRUE(m->SetData(&sample, 1, true)); }),
             "asr result:hello\nasr result:\nasr result:\nasr result:hello world\n"
             "asr result:x\nmoxwing speech end\nasr result:final words\n");
-  EXPECT_EQ(delivered_, (std::vector<std::pair<std::string, bool>>{
-                            {"hello", false}, {"hello world", true}, {"x", false},
-                            {"final words", true}}));
+  EXPECT_EQ(delivered_,
+            (std::vector<std::pair<std::string, bool>>{
+                {"hello", false}, {"hello world", true}, {"x", false}, {"final words", true}}));
 }
 
 TEST_F(MoxwingTest, GlobalInitSetsTheSharedLimitWithAOneSecondFloor) {
   const std::pair<const char*, int64_t> steps[] = {
       {R"({"moxwing_max_duration":60000})", 60000},
-      {R"({"moxwing_max_duration":"5"})", 60000},  // not a number: unchanged
+      {R"({"moxwing_max_duration":"5"})", 60000},    // not a number: unchanged
       {R"({"moxwing_max_duration":999.9})", 30000},  // below a second: the default
   };
   for (const auto& s : steps) {

@@ -48,12 +48,9 @@ TEST_F(PunctuatorTest, BufferTooSmallIsRetriedOnceWithTheRequestedSize) {
 
 TEST_F(PunctuatorTest, FailuresAndImplausibleSizesGiveEmptyText) {
   const Reply replies[] = {
-      {2, 3, "abc"},
-      {0, 5000, "abc"},  // claims more than the buffer
-      {0, -1, ""},
-      {1, -5, ""},
-      {1, 0x7FFFFFFF, ""},  // would need 2 GiB
-      {0, 0, ""},           // an empty answer is empty
+      {2, 3, "abc"}, {0, 5000, "abc"},                       // claims more than the buffer
+      {0, -1, ""},   {1, -5, ""},      {1, 0x7FFFFFFF, ""},  // would need 2 GiB
+      {0, 0, ""},                                            // an empty answer is empty
   };
   for (const Reply& reply : replies) {
     SCOPED_TRACE(reply.size);

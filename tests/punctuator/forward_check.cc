@@ -11,6 +11,7 @@
 #include <string>
 #include <vector>
 
+#include "cpu_dispatch.h"
 #include "punctuator.h"
 
 namespace {
@@ -37,11 +38,12 @@ int main(int argc, char** argv) {
     std::cerr << "usage: " << argv[0] << " MODEL_DIR REFERENCE_TSV [--baseline]\n";
     return 2;
   }
-  kvasr::punct::UseBaselineProducts(baseline);
+  kvasr_common::ForceBaseline(baseline);
   const std::string d = std::string(argv[1]) + "/";
   std::string error;
   const auto p = kvasr::punct::Punctuator::Create(
-      {d + "model.bin", d + "vocab.txt", d + "punc.txt", d + "num.txt", d + "case.txt", d + "xdb.txt", d + "bpe.txt"},
+      {d + "model.bin", d + "vocab.txt", d + "punc.txt", d + "num.txt", d + "case.txt",
+       d + "xdb.txt", d + "bpe.txt"},
       "en", &error);
   if (!p) {
     std::cerr << error << "\n";
@@ -86,7 +88,7 @@ int main(int argc, char** argv) {
     compare(r.punct, punct);
     compare(r.casing, casing);
   }
-  std::printf("%zu texts, %d values, largest difference %.2g, %d beyond %.0e\n", references.size(), values, worst,
-              bad, kTolerance);
+  std::printf("%zu texts, %d values, largest difference %.2g, %d beyond %.0e\n", references.size(),
+              values, worst, bad, kTolerance);
   return bad == 0 && values > 0 ? 0 : 1;
 }

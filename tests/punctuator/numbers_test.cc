@@ -16,7 +16,9 @@ class NumbersTest : public testing::Test {
  protected:
   static void SetUpTestSuite() {
     std::string error;
-    ASSERT_TRUE(rules_.Load(KVASR_PUNCT_MODEL_DIR "/num.txt", KVASR_PUNCT_MODEL_DIR "/xdb.txt", &error)) << error;
+    ASSERT_TRUE(
+        rules_.Load(KVASR_PUNCT_MODEL_DIR "/num.txt", KVASR_PUNCT_MODEL_DIR "/xdb.txt", &error))
+        << error;
   }
 
   // `text` with the rules applied; '|' after a word stands for a mark the
@@ -61,48 +63,88 @@ struct Case {
 // Cardinals said plainly and years said in pairs are SpelledNumbersAndYears'.
 const Case kCases[] = {
     // Numbers within text; "and"; round hundreds and thousands.
-    {"twenty one people", "21 people"}, {"about thirty seven percent", "about 37 percent"},
-    {"in nineteen eighty four", "in 1984"}, {"two hundred and five", "205"},
-    {"two thousand and ten", "2010"}, {"two thousand and eight", "2008"},
-    {"twenty five hundred", "2500"}, {"fifteen hundred", "1500"}, {"nineteen hundred", "1900"},
-    {"ten thousand", "10,000"}, {"fifty thousand people", "50,000 people"},
+    {"twenty one people", "21 people"},
+    {"about thirty seven percent", "about 37 percent"},
+    {"in nineteen eighty four", "in 1984"},
+    {"two hundred and five", "205"},
+    {"two thousand and ten", "2010"},
+    {"two thousand and eight", "2008"},
+    {"twenty five hundred", "2500"},
+    {"fifteen hundred", "1500"},
+    {"nineteen hundred", "1900"},
+    {"ten thousand", "10,000"},
+    {"fifty thousand people", "50,000 people"},
     {"one hundred twenty three thousand four hundred fifty six", "123,456"},
     {"one million two hundred thousand", "1,200,000"},
-    {"a hundred and fifty", "150"}, {"a thousand and one nights", "1001 nights"},
+    {"a hundred and fifty", "150"},
+    {"a thousand and one nights", "1001 nights"},
     // Round large numbers keep the scale word.
-    {"two million", "2 million"}, {"three hundred million", "300 million"},
-    {"seven billion people", "7 billion people"}, {"one trillion", "1 trillion"},
+    {"two million", "2 million"},
+    {"three hundred million", "300 million"},
+    {"seven billion people", "7 billion people"},
+    {"one trillion", "1 trillion"},
     {"two point five billion", "2.5 billion"},
     // Years and decades said otherwise.
-    {"nineteen oh five", "1905"}, {"nineteen sixties", "1960s"},
+    {"nineteen oh five", "1905"},
+    {"nineteen sixties", "1960s"},
     // Decimals.
-    {"three point five", "3.5"}, {"zero point two", "0.2"}, {"three point one four", "3.14"},
-    {"one point oh five", "1.05"}, {"ninety nine point nine percent", "99.9 percent"},
+    {"three point five", "3.5"},
+    {"zero point two", "0.2"},
+    {"three point one four", "3.14"},
+    {"one point oh five", "1.05"},
+    {"ninety nine point nine percent", "99.9 percent"},
     // Ordinals.
-    {"twenty first century", "21st century"}, {"the twenty second", "the 22nd"},
-    {"the thirty third floor", "the 33rd floor"}, {"eleventh", "11th"}, {"twelfth", "12th"},
-    {"the hundredth time", "the hundredth time"}, {"one hundredth", "100th"}, {"fortieth birthday", "40th birthday"},
-    {"one hundred and first", "101st"}, {"the first time", "the first time"},
+    {"twenty first century", "21st century"},
+    {"the twenty second", "the 22nd"},
+    {"the thirty third floor", "the 33rd floor"},
+    {"eleventh", "11th"},
+    {"twelfth", "12th"},
+    {"the hundredth time", "the hundredth time"},
+    {"one hundredth", "100th"},
+    {"fortieth birthday", "40th birthday"},
+    {"one hundred and first", "101st"},
+    {"the first time", "the first time"},
     {"second place", "second place"},
     // Small numbers and idioms stay in words.
-    {"one of them", "one of them"}, {"two people", "two people"}, {"no one", "no one"},
-    {"one another", "one another"}, {"zero", "zero"}, {"nine lives", "nine lives"},
-    {"one two three", "one two three"}, {"a hundred", "a hundred"}, {"a million dollars", "a million dollars"},
-    {"a thousand years", "a thousand years"}, {"hundreds of thousands", "hundreds of thousands"},
-    {"fifty fifty", "fifty fifty"}, {"twenty four seven", "twenty four seven"},
-    {"nine to five", "nine to five"}, {"thousands", "thousands"}, {"the sixties", "the sixties"},
-    {"point", "point"}, {"the point is", "the point is"}, {"hundred", "hundred"},
-    {"and", "and"}, {"oh no", "oh no"}, {"a lot", "a lot"},
+    {"one of them", "one of them"},
+    {"two people", "two people"},
+    {"no one", "no one"},
+    {"one another", "one another"},
+    {"zero", "zero"},
+    {"nine lives", "nine lives"},
+    {"one two three", "one two three"},
+    {"a hundred", "a hundred"},
+    {"a million dollars", "a million dollars"},
+    {"a thousand years", "a thousand years"},
+    {"hundreds of thousands", "hundreds of thousands"},
+    {"fifty fifty", "fifty fifty"},
+    {"twenty four seven", "twenty four seven"},
+    {"nine to five", "nine to five"},
+    {"thousands", "thousands"},
+    {"the sixties", "the sixties"},
+    {"point", "point"},
+    {"the point is", "the point is"},
+    {"hundred", "hundred"},
+    {"and", "and"},
+    {"oh no", "oh no"},
+    {"a lot", "a lot"},
     // Where a number stops.
-    {"twenty three four", "23 four"}, {"one hundred and", "100 and"},
-    {"two thousand and", "2000 and"}, {"seven point", "seven point"},
+    {"twenty three four", "23 four"},
+    {"one hundred and", "100 and"},
+    {"two thousand and", "2000 and"},
+    {"seven point", "seven point"},
     {"thirty forty", "30 40"},
-    {"million", "million"}, {"thousand two", "thousand two"},
+    {"million", "million"},
+    {"thousand two", "thousand two"},
     // A mark the network placed inside splits the number.
-    {"twenty| three", "20 three"}, {"nineteen| ninety five", "19 95"},
-    {"one hundred| twenty", "100 20"}, {"three point| five", "three point five"},
+    {"twenty| three", "20 three"},
+    {"nineteen| ninety five", "19 95"},
+    {"one hundred| twenty", "100 20"},
+    {"three point| five", "three point five"},
     // Not number words.
-    {"twentyish", "twentyish"}, {"tenth-grade", "tenth-grade"}, {"", ""},
+    {"twentyish", "twentyish"},
+    {"tenth-grade", "tenth-grade"},
+    {"", ""},
 };
 
 TEST_F(NumbersTest, Table) {
@@ -115,7 +157,8 @@ std::string Spell(int n) {
                                  "five",    "six",     "seven",     "eight",    "nine",
                                  "ten",     "eleven",  "twelve",    "thirteen", "fourteen",
                                  "fifteen", "sixteen", "seventeen", "eighteen", "nineteen"};
-  static const char* kTens[] = {"", "", "twenty", "thirty", "forty", "fifty", "sixty", "seventy", "eighty", "ninety"};
+  static const char* kTens[] = {"",      "",      "twenty",  "thirty", "forty",
+                                "fifty", "sixty", "seventy", "eighty", "ninety"};
   std::string s;
   const auto add = [&](const std::string& w) { s += (s.empty() ? "" : " ") + w; };
   if (n >= 1000) add(std::string(kUnits[n / 1000]) + " thousand"), n %= 1000;
@@ -152,7 +195,8 @@ TEST(NumberRulesLoad, RejectsBadFiles) {
   EXPECT_NE(error.find("cannot open"), std::string::npos) << error;
   // The xdb file is a vocabulary of phrases, not number words.
   EXPECT_FALSE(rules.Load(KVASR_PUNCT_MODEL_DIR "/xdb.txt", "", &error));
-  EXPECT_FALSE(rules.Load(KVASR_PUNCT_MODEL_DIR "/num.txt", KVASR_PUNCT_MODEL_DIR "/num.txt", &error));
+  EXPECT_FALSE(
+      rules.Load(KVASR_PUNCT_MODEL_DIR "/num.txt", KVASR_PUNCT_MODEL_DIR "/num.txt", &error));
   EXPECT_TRUE(rules.Load(KVASR_PUNCT_MODEL_DIR "/num.txt", "", &error)) << error;
 }
 

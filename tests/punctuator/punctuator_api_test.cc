@@ -19,7 +19,8 @@ namespace {
 using kvasr_test::Words;
 
 const std::string kModelDir = KVASR_PUNCT_MODEL_DIR;
-const char* const kFileNames[] = {"model.bin", "vocab.txt", "punc.txt", "num.txt", "case.txt", "xdb.txt", "bpe.txt"};
+const char* const kFileNames[] = {"model.bin", "vocab.txt", "punc.txt", "num.txt",
+                                  "case.txt",  "xdb.txt",   "bpe.txt"};
 enum FileIndex { kModel, kVocab, kPunc, kNum, kCase, kXdb, kBpe };
 using Paths = std::array<std::string, 7>;
 
@@ -106,13 +107,15 @@ TEST_F(ModelTest, KeepsEveryWordAndMarksTheEnd) {
 
 // The features the model must get right on any sensible training.
 TEST_F(ModelTest, PunctuatesCasesAndWritesNumbers) {
-  const std::string out =
-      Punctuate(handle_, "what do you think happened next i asked my friend john in new york and he said nothing");
+  const std::string out = Punctuate(
+      handle_,
+      "what do you think happened next i asked my friend john in new york and he said nothing");
   EXPECT_NE(out.find('?'), std::string::npos) << out;
   EXPECT_EQ(out.rfind("What ", 0), 0u) << out;
   EXPECT_NE(out.find(" I "), std::string::npos) << out;
   EXPECT_NE(out.find("New York"), std::string::npos) << out;
-  const std::string numbers = Punctuate(handle_, "she was born in nineteen ninety five and has twenty three cats");
+  const std::string numbers =
+      Punctuate(handle_, "she was born in nineteen ninety five and has twenty three cats");
   EXPECT_NE(numbers.find(" 1995"), std::string::npos) << numbers;
   EXPECT_NE(numbers.find(" 23 cats"), std::string::npos) << numbers;
   EXPECT_EQ(Words(numbers).size(), 9u) << numbers;
@@ -148,7 +151,8 @@ TEST_F(ModelTest, VeryLongTextIsPunctuatedThroughout) {
 
 TEST_F(ModelTest, AllocatesNothingOnceBuffersHaveGrownToTheLongestText) {
   const char* const texts[] = {
-      "so what did you do in nineteen ninety five when you were twenty three years old and lived in paris",
+      "so what did you do in nineteen ninety five when you were twenty three years old and lived "
+      "in paris",
       "we had three point five million people and one of them was called john",
       "ok",
   };
@@ -166,8 +170,10 @@ TEST_F(ModelTest, AllocatesNothingOnceBuffersHaveGrownToTheLongestText) {
 TEST_F(ModelTest, BadArgumentsFail) {
   char buf[10];
   int32_t size = 10, negative = -1;
-  for (int r : {punctuator_do_it(nullptr, "hello", buf, &size), punctuator_do_it(handle_, nullptr, buf, &size),
-                punctuator_do_it(handle_, "hello", buf, nullptr), punctuator_do_it(handle_, "hello", nullptr, &size),
+  for (int r : {punctuator_do_it(nullptr, "hello", buf, &size),
+                punctuator_do_it(handle_, nullptr, buf, &size),
+                punctuator_do_it(handle_, "hello", buf, nullptr),
+                punctuator_do_it(handle_, "hello", nullptr, &size),
                 punctuator_do_it(handle_, "hello", buf, &negative)}) {
     EXPECT_NE(r, 0);
     EXPECT_NE(r, 1);

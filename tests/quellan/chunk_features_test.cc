@@ -23,10 +23,10 @@ quellan_test::RowLog Rows(const std::string& dir, const std::vector<int16_t>& au
   std::vector<int16_t> out(dropped.size() + 64000);
   int out_len = 0, speech = 0, continued = 0, ended = 0;
   testing::internal::CaptureStdout();
-  EXPECT_EQ(pipe.quellan_process(1, dropped.data(), static_cast<int>(dropped.size()),
-                                 out.data(), static_cast<int>(out.size()), &out_len,
-                                 &speech, &continued, &ended),
-            0);
+  EXPECT_EQ(
+      pipe.quellan_process(1, dropped.data(), static_cast<int>(dropped.size()), out.data(),
+                           static_cast<int>(out.size()), &out_len, &speech, &continued, &ended),
+      0);
   quellan_test::RowLog log;
   pipe.set_frame_observer(&log);
   quellan_test::RunUtterance(&pipe, audio, chunk);
@@ -48,8 +48,7 @@ TEST(ChunkFeaturesTest, EveryChunkSizeGivesTheRowsOfOneCall) {
     SCOPED_TRACE(chunk);
     const quellan_test::RowLog part = Rows(dir, audio, chunk);
     ASSERT_EQ(part.frames, whole.frames);
-    EXPECT_EQ(std::memcmp(part.rows.data(), whole.rows.data(),
-                          sizeof(float) * whole.rows.size()),
+    EXPECT_EQ(std::memcmp(part.rows.data(), whole.rows.data(), sizeof(float) * whole.rows.size()),
               0);
   }
 }

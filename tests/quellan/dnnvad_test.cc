@@ -63,8 +63,8 @@ class DetectorHarness {
     CallResult r;
     const VadOutputLists lists{&cut_num_, cut_frame_, &seg_num_, seg_beg_, seg_end_, 5};
     const int rows = static_cast<int>(feat_.size());
-    r.ret = vad_->add_wave_data(last ? -calls_ : calls_, samples, len, feat_.data(), 1, rows,
-                                rows, &r.consumed, lists);
+    r.ret = vad_->add_wave_data(last ? -calls_ : calls_, samples, len, feat_.data(), 1, rows, rows,
+                                &r.consumed, lists);
     if (r.ret >= 0) feat_.erase(feat_.begin(), feat_.begin() + r.consumed);
     r.cuts.assign(cut_frame_, cut_frame_ + cut_num_);
     for (int i = 0; i < seg_num_; ++i) r.intervals.emplace_back(seg_beg_[i], seg_end_[i]);
@@ -110,18 +110,26 @@ TEST(DetectorTest, SegmentsOfOneCall) {
     std::vector<int> cuts;
   };
   const Case cases[] = {
-      {"margin to middle of closing silence", Pattern(300, {{100, 200}}), {},
-       {{85, 200 + 99 / 2}}, {249}},
+      {"margin to middle of closing silence",
+       Pattern(300, {{100, 200}}),
+       {},
+       {{85, 200 + 99 / 2}},
+       {249}},
       {"margin stops at frame zero", Pattern(100, {{5, 40}}), {}, {{0, 40 + 59 / 2}}, {69}},
       // A gap inside one batch closes at 29 frames, one sooner than across
       // calls: established behaviour, kept on purpose.
-      {"gap of 28 frames", Pattern(300, {{50, 100}, {128, 180}}), {}, {{35, 180 + 119 / 2}},
-       {239}},
-      {"gap of 29 frames", Pattern(300, {{50, 100}, {129, 180}}), {},
-       {{35, 114}, {114, 180 + 119 / 2}}, {114, 239}},
+      {"gap of 28 frames", Pattern(300, {{50, 100}, {128, 180}}), {}, {{35, 180 + 119 / 2}}, {239}},
+      {"gap of 29 frames",
+       Pattern(300, {{50, 100}, {129, 180}}),
+       {},
+       {{35, 114}, {114, 180 + 119 / 2}},
+       {114, 239}},
       // Loud audio in frames 100..199 reaches the windows of frames 98..199.
-      {"energy gate vetoes quiet frames", std::vector<bool>(300, true),
-       Pattern(300, {{100, 200}}), {{83, 200 + 99 / 2}}, {249}},
+      {"energy gate vetoes quiet frames",
+       std::vector<bool>(300, true),
+       Pattern(300, {{100, 200}}),
+       {{83, 200 + 99 / 2}},
+       {249}},
   };
   for (const Case& c : cases) {
     SCOPED_TRACE(c.name);
@@ -199,8 +207,7 @@ TEST(DetectorTest, MoreIntervalsThanSlotsKeepsTheLatest) {
   const std::string out = testing::internal::GetCapturedStdout();
   // Eight segments: the first five cuts and the last five intervals stay.
   EXPECT_EQ(r.cuts, (std::vector<int>{89, 149, 209, 269, 329}));
-  EXPECT_EQ(r.intervals,
-            (Intervals{{215, 269}, {275, 329}, {335, 389}, {395, 449}, {455, 544}}));
+  EXPECT_EQ(r.intervals, (Intervals{{215, 269}, {275, 329}, {335, 389}, {395, 449}, {455, 544}}));
   EXPECT_NE(out.find("Too many intervals in one call"), std::string::npos);
   EXPECT_NE(out.find("Too many cut frames in one call"), std::string::npos);
 }
@@ -227,12 +234,10 @@ TEST(DetectorTest, FailuresNameTheirCause) {
     std::string message;
   };
   const Case cases[] = {
-      {[](VadDnnConf* c) { std::snprintf(c->dnn_file, kVadPathBytes, "/nonexistent/net"); },
-       0, "<<Cdnnvad>>] Failed to load vad dnn file[/nonexistent/net].\n"},
+      {[](VadDnnConf* c) { std::snprintf(c->dnn_file, kVadPathBytes, "/nonexistent/net"); }, 0,
+       "<<Cdnnvad>>] Failed to load vad dnn file[/nonexistent/net].\n"},
       {[](VadDnnConf* c) { c->end_offset = 4; }, 0, "Failed to set_dnn_params\n"},
-      {[](VadDnnConf* c) {
-         std::snprintf(c->state_weights_file, kVadPathBytes, "/nonexistent/p");
-       },
+      {[](VadDnnConf* c) { std::snprintf(c->state_weights_file, kVadPathBytes, "/nonexistent/p"); },
        0, "Failed to load state-weights file[/nonexistent/p].\n"},
       {[](VadDnnConf* c) { c->max_frames = 20; }, 21,
        "<<add_wave_data>>] Invalide input arguments to Cdnnvad::AddWaveData\n"},

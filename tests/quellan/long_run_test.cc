@@ -17,8 +17,7 @@ constexpr int kRate = 16000;
 
 TEST(LongRunTest, TwelveMinutesWithoutResetStayInFixedMemory) {
   std::vector<int16_t> speech;
-  const std::string path =
-      quellan_test::CorpusPath("speech/librispeech/103/103-1240-0000.flac");
+  const std::string path = quellan_test::CorpusPath("speech/librispeech/103/103-1240-0000.flac");
   if (!quellan_test::ReadFlac(path, &speech)) GTEST_SKIP() << "corpus missing: " << path;
 
   // Speech then six seconds of quiet, repeated past twelve minutes.
@@ -62,10 +61,10 @@ TEST(LongRunTest, MemoryDoesNotGrowWithListeningTime) {
         const int r = static_cast<int>((seed >> 16) % 2001) - 1000;
         s = static_cast<int16_t>(second % 4 < 2 ? r * 5 : r / 200);
       }
-      ASSERT_EQ(pipe.quellan_process(++index, chunk.data(), 1600, out.data(),
-                                     static_cast<int>(out.size()), &out_len, &speech,
-                                     &continued, &ended),
-                0)
+      ASSERT_EQ(
+          pipe.quellan_process(++index, chunk.data(), 1600, out.data(),
+                               static_cast<int>(out.size()), &out_len, &speech, &continued, &ended),
+          0)
           << "second " << second;
     }
     if (second == 180) after_warm_up = quellan_test::ResidentKiB();

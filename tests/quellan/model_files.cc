@@ -34,8 +34,8 @@ std::string ReadBytes(const std::string& path) {
 
 void WriteNetwork(const std::string& path, const Network& net, const std::string& flag) {
   std::string bytes = flag;
-  Append<int32_t>(&bytes, {net.input_length, net.output_length,
-                           static_cast<int32_t>(net.hidden.size())});
+  Append<int32_t>(&bytes,
+                  {net.input_length, net.output_length, static_cast<int32_t>(net.hidden.size())});
   Append<int32_t>(&bytes, {net.hidden.begin(), net.hidden.end()});
   for (const Layer& layer : net.layers) {
     Append(&bytes, layer.bias);
@@ -69,8 +69,7 @@ Network ConstantNetwork(int input_length, float score) {
   return net;
 }
 
-Network SignNetwork(int feat_dim, int start_offset, int end_offset,
-                    int column) {
+Network SignNetwork(int feat_dim, int start_offset, int end_offset, int column) {
   Network net = ConstantNetwork(feat_dim * (1 + start_offset + end_offset), -20.0f);
   net.layers[0].weights[start_offset * feat_dim + column] = 20.0f;
   // Non-speech logit 0, speech logit 40 h - 20: a saturated +/-20 margin.

@@ -51,8 +51,7 @@ inline QuellanConf PipelineConf(const std::string& dir, bool exact) {
 // Runs `audio` through `pipe` in chunks of `chunk` samples as one utterance
 // and checks every call: it succeeds, each interval holds the audio at its
 // frames, and `out` holds the last interval. Returns one record per call.
-inline std::vector<Emission> RunUtterance(Cquellan* pipe,
-                                          const std::vector<int16_t>& audio,
+inline std::vector<Emission> RunUtterance(Cquellan* pipe, const std::vector<int16_t>& audio,
                                           size_t chunk) {
   std::vector<Emission> calls;
   std::vector<int16_t> out(chunk + 64000);
@@ -62,10 +61,9 @@ inline std::vector<Emission> RunUtterance(Cquellan* pipe,
     ++index;
     const bool last = pos + len == audio.size();
     Emission e;
-    e.ret = pipe->quellan_process(last ? -index : index, audio.data() + pos,
-                                  static_cast<int>(len), out.data(),
-                                  static_cast<int>(out.size()), &e.out_len,
-                                  &e.speech, &e.continued, &e.ended);
+    e.ret = pipe->quellan_process(last ? -index : index, audio.data() + pos, static_cast<int>(len),
+                                  out.data(), static_cast<int>(out.size()), &e.out_len, &e.speech,
+                                  &e.continued, &e.ended);
     EXPECT_EQ(e.ret, 0) << "call " << index;
     for (int i = 0; i < pipe->emitted_count(); ++i) {
       const Cquellan::Interval iv = pipe->emitted(i);
@@ -76,13 +74,11 @@ inline std::vector<Emission> RunUtterance(Cquellan* pipe,
       const size_t begin = static_cast<size_t>(iv.begin_frame) * 160;
       const size_t count = static_cast<size_t>(iv.end_frame - iv.begin_frame + 1) * 160;
       EXPECT_EQ(iv.sample_count, static_cast<int>(std::min<size_t>(count, 32000)));
-      EXPECT_TRUE(std::equal(iv.samples, iv.samples + iv.sample_count,
-                             audio.begin() + begin))
+      EXPECT_TRUE(std::equal(iv.samples, iv.samples + iv.sample_count, audio.begin() + begin))
           << "call " << index << " interval " << i;
       if (i + 1 == pipe->emitted_count() && e.speech) {
         EXPECT_EQ(e.out_len, static_cast<int>(count));
-        EXPECT_TRUE(std::equal(out.begin(), out.begin() + e.out_len,
-                               audio.begin() + begin))
+        EXPECT_TRUE(std::equal(out.begin(), out.begin() + e.out_len, audio.begin() + begin))
             << "call " << index;
       }
     }

@@ -20,8 +20,7 @@ std::unique_ptr<PitchTracker> MakeTracker() {
 
 // Faint noise, then a harmonic complex of `f0_hz` whose harmonic h has
 // amplitude 1 / h^tilt up to 7.5 kHz (tilt 0: pulse-like flat spectrum).
-std::vector<int16_t> NoiseThenTone(double f0_hz, double tilt, int lead_samples,
-                                   int tone_samples) {
+std::vector<int16_t> NoiseThenTone(double f0_hz, double tilt, int lead_samples, int tone_samples) {
   std::vector<int16_t> x(static_cast<size_t>(lead_samples + tone_samples));
   unsigned seed = 7;
   for (int i = 0; i < lead_samples; ++i) {
@@ -43,7 +42,7 @@ std::vector<int16_t> NoiseThenTone(double f0_hz, double tilt, int lead_samples,
 TEST(PitchTrackerTables, MelEdgesAndWindowSymmetry) {
   std::vector<int> edges(kMelEdges);
   PitchMelEdges(edges.data());
-  EXPECT_EQ(edges, (std::vector<int>{2,  4,  6,  8,  11, 13, 16, 19,  22,  26,  30,  34, 38,
+  EXPECT_EQ(edges, (std::vector<int>{2,  4,  6,  8,  11, 13, 16, 19, 22, 26,  30,  34, 38,
                                      43, 48, 54, 60, 66, 73, 81, 89, 97, 107, 117, 128}));
   // Symmetric about sample 99.5 up to the rounding of the single-precision
   // 2 pi, and above zero at both ends.
@@ -101,8 +100,7 @@ TEST(PitchTrackerAccuracy, SyntheticHarmonicComplexes) {
       const std::vector<int16_t> x = NoiseThenTone(f0, tilt, lead, kRate);
       int estimates = 0;
       double worst = 0.0;
-      for (size_t pos = 0; pos + kPitchFrameSamples <= x.size();
-           pos += kPitchFrameSamples) {
+      for (size_t pos = 0; pos + kPitchFrameSamples <= x.size(); pos += kPitchFrameSamples) {
         float raw = FLT_MAX;
         AnalyseFrame(t.get(), x.data() + pos, &raw);
         ToneStateTake(&t->post, nullptr);

@@ -103,8 +103,7 @@ TEST(PlpBlockTest, RefusesEmptyAndOversizedBlocks) {
   for (const char* message :
        {"<<AddWaveData>>] Null m_bInitialize[1] or waveData[", "or smpNum[0]\n",
         "<<extract_feature>>] Failed to add wave data.\n",
-        "Too many frames[50] >= max_frame_num[50]\n",
-        "<<extract_feature>>] Too many frames.\n"}) {
+        "Too many frames[50] >= max_frame_num[50]\n", "<<extract_feature>>] Too many frames.\n"}) {
     EXPECT_NE(out.find(message), std::string::npos) << message;
   }
   EXPECT_EQ(rows[0], -7.0f) << "a refused block writes nothing";

@@ -147,11 +147,11 @@ TEST_F(PipelineTest, RefusesWhatDoesNotFit) {
 
   const std::vector<int16_t> too_long(13000 * 160 + 1);
   out_len = speech = continued = ended = 0;
-  EXPECT_EQ(pipe->quellan_process(1, too_long.data(), static_cast<int>(too_long.size()),
-                                  out.data(), 1000, &out_len, &speech, &continued, &ended),
+  EXPECT_EQ(pipe->quellan_process(1, too_long.data(), static_cast<int>(too_long.size()), out.data(),
+                                  1000, &out_len, &speech, &continued, &ended),
             -1);
-  EXPECT_EQ(pipe->quellan_process(1, nullptr, 10, out.data(), 1000, &out_len, &speech,
-                                  &continued, &ended),
+  EXPECT_EQ(pipe->quellan_process(1, nullptr, 10, out.data(), 1000, &out_len, &speech, &continued,
+                                  &ended),
             0);
   EXPECT_EQ(out_len + speech + continued + ended, 0);
   const std::string log = testing::internal::GetCapturedStdout();
@@ -251,14 +251,12 @@ TEST_F(PipelineTest, SurvivesArbitraryCallSequences) {
   testing::internal::CaptureStdout();
   for (int call = 0; call < 3000; ++call) {
     const int index = static_cast<int>(next(60)) - 8;
-    const int len = next(10) == 0 ? static_cast<int>(next(200000))
-                                  : static_cast<int>(next(3000));
+    const int len = next(10) == 0 ? static_cast<int>(next(200000)) : static_cast<int>(next(3000));
     const size_t start = next(static_cast<unsigned>(audio.size() - 200000));
     const int capacity = static_cast<int>(next(50001));
     int out_len = 0, speech = 0, continued = 0, ended = 0;
-    const int ret = pipe->quellan_process(index, audio.data() + start, len, out.data(),
-                                          capacity, &out_len, &speech, &continued,
-                                          &ended);
+    const int ret = pipe->quellan_process(index, audio.data() + start, len, out.data(), capacity,
+                                          &out_len, &speech, &continued, &ended);
     ASSERT_TRUE(ret == 0 || ret == -1);
     ASSERT_GE(out_len, 0);
     ASSERT_LE(out_len, capacity);

@@ -18,7 +18,7 @@
 #include <string>
 #include <vector>
 
-#include "cpu_features.h"
+#include "cpu_dispatch.h"
 #include "model_files.h"
 #include "plp.h"
 #include "vad_dnn.h"
@@ -29,17 +29,15 @@ template <typename T>
 std::vector<T> ReadArray(const std::string& path) {
   const std::string bytes = quellan_test::ReadBytes(path);
   std::vector<T> v(bytes.size() / sizeof(T));
-  std::copy(bytes.data(), bytes.data() + v.size() * sizeof(T),
-            reinterpret_cast<char*>(v.data()));
+  std::copy(bytes.data(), bytes.data() + v.size() * sizeof(T), reinterpret_cast<char*>(v.data()));
   return v;
 }
 
 int Decode(const std::string& in, const std::string& out) {
   std::vector<int16_t> samples;
   if (!quellan_test::ReadFlac(in, &samples)) return 1;
-  quellan_test::WriteBytes(
-      out, std::string(reinterpret_cast<const char*>(samples.data()),
-                       samples.size() * sizeof(int16_t)));
+  quellan_test::WriteBytes(out, std::string(reinterpret_cast<const char*>(samples.data()),
+                                            samples.size() * sizeof(int16_t)));
   return 0;
 }
 
@@ -64,8 +62,8 @@ int RunPlp(int argc, char** argv) {
     int start = 0, end = 0, flag = 0;
     if (std::sscanf(argv[i], "%d:%d:%d", &start, &end, &flag) != 3) return 1;
     int frames = 0;
-    if (plp.extract_feature(samples.data() + start, end - start, rows.data(),
-                            13000, &frames, flag) != 0) {
+    if (plp.extract_feature(samples.data() + start, end - start, rows.data(), 13000, &frames,
+                            flag) != 0) {
       return 1;
     }
     const int32_t count = frames;
@@ -94,14 +92,12 @@ int RunDnn(char** argv) {
   const bool ok =
       set_vaddnn_params(dnn, total, std::atoi(argv[11]), std::atoi(argv[12])) == 0 &&
       load_vaddnn_state_weights(dnn, argv[3]) == 0 &&
-      set_vaddnn_feature(dnn, feat.data(), feat_dim, t0, first, last, total,
-                         skip, &rows) == 0 &&
+      set_vaddnn_feature(dnn, feat.data(), feat_dim, t0, first, last, total, skip, &rows) == 0 &&
       calc_vaddnn_prob(dnn, rows, score.data()) == rows;
   free_vaddnn(dnn);
   if (!ok) return 1;
-  quellan_test::WriteBytes(argv[13],
-                           std::string(reinterpret_cast<const char*>(score.data()),
-                                       sizeof(float) * rows));
+  quellan_test::WriteBytes(
+      argv[13], std::string(reinterpret_cast<const char*>(score.data()), sizeof(float) * rows));
   return 0;
 }
 
@@ -109,7 +105,7 @@ int RunDnn(char** argv) {
 
 int main(int argc, char** argv) {
   const char* baseline = std::getenv("QUELLAN_BASELINE_LOOPS");
-  if (baseline != nullptr && std::string(baseline) == "1") cpu_force_baseline(true);
+  if (baseline != nullptr && std::string(baseline) == "1") kvasr_common::ForceBaseline(true);
   const std::string command = argc > 1 ? argv[1] : "";
   if (command == "decode" && argc == 4) return Decode(argv[2], argv[3]);
   if (command == "plp" && argc >= 6) return RunPlp(argc, argv);

@@ -60,17 +60,16 @@ ToneRun RunTone(const std::vector<int16_t>& audio, const std::vector<int>& chunk
     int raw_count = -1;
     EXPECT_EQ(tone->ExtractToneFeature(audio.data() + pos, len,
                                        run.features.data() + run.frames * kToneDim,
-                                       capacity - run.frames, &written,
-                                       run.raw.data() + raw_total, capacity - raw_total,
-                                       &raw_count),
+                                       capacity - run.frames, &written, run.raw.data() + raw_total,
+                                       capacity - raw_total, &raw_count),
               0);
     run.frames += written;
     raw_total += raw_count;
     pos += static_cast<size_t>(len);
   }
   int flushed = -1;
-  EXPECT_EQ(tone->EndToneFeature(run.features.data() + run.frames * kToneDim,
-                                 capacity - run.frames, &flushed),
+  EXPECT_EQ(tone->EndToneFeature(run.features.data() + run.frames * kToneDim, capacity - run.frames,
+                                 &flushed),
             0);
   run.frames += flushed;
   run.raw.resize(static_cast<size_t>(raw_total));
@@ -86,8 +85,8 @@ TEST(ToneInterfaceFraming, AnyChunkingMatchesWholeFrames) {
   const ToneRun whole = RunTone(audio, {160});
   ASSERT_GT(whole.frames, 150);
   ASSERT_GT(whole.raw.size(), 150u);
-  const std::vector<std::vector<int>> cuts = {{159, 1},     {100, 400}, {1},
-                                               {0, 320, 7}, {4000},     {161, 159, 3}};
+  const std::vector<std::vector<int>> cuts = {{159, 1},    {100, 400}, {1},
+                                              {0, 320, 7}, {4000},     {161, 159, 3}};
   for (const std::vector<int>& cut : cuts) {
     SCOPED_TRACE(cut[0]);
     const ToneRun run = RunTone(audio, cut);
@@ -128,8 +127,8 @@ TEST(ToneInterfacePipeline, ToneColumnsFollowThePlpColumns) {
     const float* row = tone_rows.rows.data() + i * kRow;
     EXPECT_TRUE(std::equal(row, row + kPlpDim, plain_rows.rows.begin() + i * kPlpDim));
     const size_t source = std::min<size_t>(i, reference.frames - 1);
-    EXPECT_TRUE(std::equal(row + kPlpDim, row + kRow,
-                           reference.features.begin() + source * kToneDim));
+    EXPECT_TRUE(
+        std::equal(row + kPlpDim, row + kRow, reference.features.begin() + source * kToneDim));
   }
 }
 

@@ -35,11 +35,9 @@ TEST(ToneStateTest, DelayPendingAndFlushCounts) {
   for (int pushed : {0, 1, 26, 27, 28, 100}) {
     SCOPED_TRACE(pushed);
     auto s = Fresh();
-    const std::vector<float> out =
-        PushTrack(s.get(), std::vector<float>(pushed, 40.0f));
+    const std::vector<float> out = PushTrack(s.get(), std::vector<float>(pushed, 40.0f));
     const int held = std::min(pushed, kToneDelayFrames);
-    EXPECT_EQ(static_cast<int>(out.size()) / kToneValuesPerFrame,
-              pushed - held);
+    EXPECT_EQ(static_cast<int>(out.size()) / kToneValuesPerFrame, pushed - held);
     EXPECT_EQ(ToneStatePending(s.get()), held);
     std::vector<float> tail(kToneOutFloats);
     EXPECT_EQ(ToneStateFlush(s.get(), tail.data()), held);
@@ -86,8 +84,7 @@ TEST(ToneStateTest, PushAndFlushNeverAllocate) {
   const long before = kvasr_test::AllocationCount();
   for (int i = 0; i < 300; ++i) {
     // Voiced runs with octave jumps and gaps exercise every selection path.
-    const float pitch =
-        i % 17 == 0 ? 0.0f : (i % 5 == 0 ? 80.0f : 40.0f + i % 3);
+    const float pitch = i % 17 == 0 ? 0.0f : (i % 5 == 0 ? 80.0f : 40.0f + i % 3);
     ToneStatePush(s.get(), pitch, kVoicedLogEnergy);
     ToneStateTake(s.get(), frame.data());
   }
@@ -97,11 +94,9 @@ TEST(ToneStateTest, PushAndFlushNeverAllocate) {
 
 TEST(ToneStateTest, WarnsWhenOutputIsNotTaken) {
   auto s = Fresh();
-  constexpr int kFillingPushes =
-      kToneDelayFrames + kToneOutFloats / kToneValuesPerFrame;
+  constexpr int kFillingPushes = kToneDelayFrames + kToneOutFloats / kToneValuesPerFrame;
   testing::internal::CaptureStdout();
-  for (int i = 0; i < kFillingPushes - 1; ++i)
-    ToneStatePush(s.get(), 40.0f, 20.0f);
+  for (int i = 0; i < kFillingPushes - 1; ++i) ToneStatePush(s.get(), 40.0f, 20.0f);
   EXPECT_EQ(testing::internal::GetCapturedStdout(), "");
   testing::internal::CaptureStdout();
   ToneStatePush(s.get(), 40.0f, 20.0f);
@@ -109,8 +104,7 @@ TEST(ToneStateTest, WarnsWhenOutputIsNotTaken) {
   EXPECT_EQ(testing::internal::GetCapturedStdout(),
             "Post-processing feature buffer exceeded!"
             "Post-processing feature buffer exceeded!");
-  EXPECT_EQ(ToneStateTake(s.get(), nullptr),
-            kToneOutFloats / kToneValuesPerFrame);
+  EXPECT_EQ(ToneStateTake(s.get(), nullptr), kToneOutFloats / kToneValuesPerFrame);
 }
 
 }  // namespace

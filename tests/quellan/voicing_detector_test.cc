@@ -6,10 +6,10 @@
 
 namespace {
 
-constexpr float kBandWeight[kMelBands] = {
-    0.3333f, 0.3333f, 0.2857f, 0.2857f, 0.2857f, 0.25f,   0.25f,   0.2222f,
-    0.2f,    0.2f,    0.2f,    0.1818f, 0.1667f, 0.1538f, 0.1429f, 0.1429f,
-    0.1333f, 0.1176f, 0.1111f, 0.1111f, 0.1f,    0.0909f, 0.087f};
+constexpr float kBandWeight[kMelBands] = {0.3333f, 0.3333f, 0.2857f, 0.2857f, 0.2857f, 0.25f,
+                                          0.25f,   0.2222f, 0.2f,    0.2f,    0.2f,    0.1818f,
+                                          0.1667f, 0.1538f, 0.1429f, 0.1429f, 0.1333f, 0.1176f,
+                                          0.1111f, 0.1111f, 0.1f,    0.0909f, 0.087f};
 constexpr float kNoise = 1e5f;
 
 // One frame whose weighted band energies are kNoise, raised by `low_db` in
@@ -45,8 +45,7 @@ TEST(VoicingDetectorTest, ScoreMustExceedThreshold) {
     float low_db[4];
     int voiced;
   };
-  const Case cases[] = {{{11.6f, 11.6f, 11.6f, 10.9f}, 0},
-                        {{11.6f, 11.6f, 11.6f, 11.6f}, 1}};
+  const Case cases[] = {{{11.6f, 11.6f, 11.6f, 10.9f}, 0}, {{11.6f, 11.6f, 11.6f, 11.6f}, 1}};
   for (const Case& c : cases) {
     VoicingState s = Settled();
     ASSERT_EQ(s.thr_voice, 58);

@@ -83,8 +83,8 @@ std::vector<Case> Cases() {
       {"NaN prior", "quellan_data_c", Ints({2}) + Floats({kNaN, 1.0f}),
        "state_weights[0] is not a positive finite number"},
       {"mean table N = 0", "quellan_data_a", MeanTable(0, unit), "read cms table error"},
-      {"mean table N = 1001", "quellan_data_a",
-       MeanTable(1001, std::vector<float>(2002, 1.0f)), "read cms table error"},
+      {"mean table N = 1001", "quellan_data_a", MeanTable(1001, std::vector<float>(2002, 1.0f)),
+       "read cms table error"},
       {"mean table N = 2^32 - 1", "quellan_data_a", MeanTable(0xFFFFFFFFu, unit),
        "read cms table error"},
       {"NaN mean", "quellan_data_a", MeanTable(kWidth, nan_mean),
@@ -97,8 +97,8 @@ std::vector<Case> Cases() {
 TEST(HostileModelFilesTest, EachFailsInitWithItsReasonAndLeavesTheEngineReusable) {
   const std::string dir = quellan_test::MakeModelDir(16.0f);
   const std::string params = R"({"local_moxwing_model_file_path":"/dev/null",)"
-                             R"("local_vad_model_dir_path":")" + dir +
-                             R"(","lang":"en-US","vad_enabled":true})";
+                             R"("local_vad_model_dir_path":")" +
+                             dir + R"(","lang":"en-US","vad_enabled":true})";
   OfflineAsrEngineImpl engine;
   for (const Case& c : Cases()) {
     SCOPED_TRACE(c.what);
@@ -112,7 +112,8 @@ TEST(HostileModelFilesTest, EachFailsInitWithItsReasonAndLeavesTheEngineReusable
     EXPECT_NE(out.find(c.message), std::string::npos) << out;
     EXPECT_NE(out.find("vad init exception:init vad failed\n"
                        "OfflineAsrEngineImpl->asr init exception:init vad failed\n"),
-              std::string::npos) << out;
+              std::string::npos)
+        << out;
     EXPECT_EQ(engine.state(), OfflineAsrEngineImpl::kNotInitialized);
     EXPECT_FALSE(engine.has_decoder()) << "the module fails before the decoder is made";
 

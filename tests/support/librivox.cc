@@ -65,8 +65,8 @@ size_t EditDistance(const std::vector<std::string>& reference,
     row[0] = i;
     for (size_t j = 1; j <= hypothesis.size(); ++j) {
       const size_t above = row[j];
-      row[j] = std::min({row[j] + 1, row[j - 1] + 1,
-                         diagonal + (reference[i - 1] == hypothesis[j - 1] ? 0 : 1)});
+      row[j] = std::min(
+          {row[j] + 1, row[j - 1] + 1, diagonal + (reference[i - 1] == hypothesis[j - 1] ? 0 : 1)});
       diagonal = above;
     }
   }

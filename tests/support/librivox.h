@@ -32,8 +32,8 @@ size_t EditDistance(const std::vector<std::string>& reference,
 
 }  // namespace kvasr_test
 
-#define KVASR_REQUIRE_LIBRIVOX()      \
-  if (!kvasr_test::HaveLibrivox())    \
+#define KVASR_REQUIRE_LIBRIVOX()   \
+  if (!kvasr_test::HaveLibrivox()) \
   GTEST_SKIP() << "recordings missing: install the Debian package pocketsphinx-testdata"
 
 #endif  // KVASR_TESTS_SUPPORT_LIBRIVOX_H_

@@ -44,20 +44,15 @@ int main(int argc, char** argv) {
   std::copy(bytes.data(), bytes.data() + rows.size() * sizeof(float),
             reinterpret_cast<char*>(rows.data()));
 
-  std::unique_ptr<VadDnn, DnnCloser> dnn(
-      load_vaddnn_file((dir + "/quellan_data_b").c_str()));
+  std::unique_ptr<VadDnn, DnnCloser> dnn(load_vaddnn_file((dir + "/quellan_data_b").c_str()));
   int spliced = 0;
   std::vector<float> scores(frames);
-  if (!dnn ||
-      set_vaddnn_params(dnn.get(), frames, kLeftContextFrames,
-                        kRightContextFrames) != 0 ||
+  if (!dnn || set_vaddnn_params(dnn.get(), frames, kLeftContextFrames, kRightContextFrames) != 0 ||
       load_vaddnn_state_weights(dnn.get(), (dir + "/quellan_data_c").c_str()) != 0 ||
-      set_vaddnn_feature(dnn.get(), rows.data(), kFeatDim, 0, 0, frames - 1,
-                         frames, 0, &spliced) != 0 ||
-      spliced != frames ||
-      calc_vaddnn_prob(dnn.get(), frames, scores.data()) != frames) {
-    std::fprintf(stderr, "the module could not score %s with %s\n", argv[2],
-                 dir.c_str());
+      set_vaddnn_feature(dnn.get(), rows.data(), kFeatDim, 0, 0, frames - 1, frames, 0, &spliced) !=
+          0 ||
+      spliced != frames || calc_vaddnn_prob(dnn.get(), frames, scores.data()) != frames) {
+    std::fprintf(stderr, "the module could not score %s with %s\n", argv[2], dir.c_str());
     return 1;
   }
   std::ofstream out(argv[3], std::ios::binary | std::ios::trunc);

@@ -50,8 +50,7 @@ struct Model {
     quellan_test::WriteNetwork(dir + "/quellan_data_b",
                                quellan_test::SignNetwork(kFeatDim, 5, 5, kC0Column));
     quellan_test::WritePriors(dir + "/quellan_data_c", {1.0f, 1.0f});
-    quellan_test::WriteMeanTable(dir + "/quellan_data_a",
-                                 std::vector<float>(kFeatDim, 0.0f),
+    quellan_test::WriteMeanTable(dir + "/quellan_data_a", std::vector<float>(kFeatDim, 0.0f),
                                  std::vector<float>(kFeatDim, 1.0f));
   }
 };
@@ -65,8 +64,7 @@ TEST(FrameObserver, ReportsEveryFrameOnceWithTheRowTheNetworkScored) {
     Recorder recorder;
     pipe.set_frame_observer(&recorder);
     quellan_test::RunUtterance(&pipe, audio, chunk);
-    const int expected = (static_cast<int>(audio.size()) - kWindowSamples) /
-                             kFrameShiftSamples + 1;
+    const int expected = (static_cast<int>(audio.size()) - kWindowSamples) / kFrameShiftSamples + 1;
     ASSERT_EQ(static_cast<int>(recorder.reports.size()), expected);
     int speech_frames = 0;
     for (int f = 0; f < expected; ++f) {

@@ -29,7 +29,9 @@ class StdinSource : public AudioSource {
 class FileSource : public AudioSource {
  public:
   FileSource(SNDFILE* file, const SF_INFO& info, SRC_STATE* resampler)
-      : file_(file), info_(info), resampler_(resampler),
+      : file_(file),
+        info_(info),
+        resampler_(resampler),
         ratio_(static_cast<double>(kEngineRateHz) / info.samplerate) {}
 
   ~FileSource() override {

@@ -53,8 +53,8 @@ int RunPitchCommand(const std::string& input, FILE* out) {
       float period = 0.0f;
       int raw_count = 0;
       int written = 0;
-      tracker->ExtractToneFeature(samples.data() + used, kFrameSamples, tone.data(), 1,
-                                  &written, &period, 1, &raw_count);
+      tracker->ExtractToneFeature(samples.data() + used, kFrameSamples, tone.data(), 1, &written,
+                                  &period, 1, &raw_count);
       const float hz = raw_count == 1 && period > 0.0f ? kPitchSampleRateHz / period : 0.0f;
       std::fprintf(out, "%ld\t%.2f\n", frame, hz);
     }

@@ -10,6 +10,7 @@
 #include <cpprest/json.h>
 
 #include "audio_source.h"
+#include "file_kind.h"
 #include "kvasr_offline.h"
 #include "model_paths.h"
 #include "progress.h"
@@ -70,7 +71,8 @@ bool LoadPunctSettings(const std::string& path, value* settings) {
                  path.c_str(), e.what());
     return false;
   }
-  const std::string dir = path.find('/') == std::string::npos ? "." : path.substr(0, path.rfind('/'));
+  const std::string dir =
+      path.find('/') == std::string::npos ? "." : path.substr(0, path.rfind('/'));
   for (const char* key : kPunctPathKeys) {
     if (settings->has_field(U(key)) && settings->at(U(key)).is_string()) {
       (*settings)[U(key)] = value::string(ResolveAgainst(dir, settings->at(U(key)).as_string()));
@@ -82,16 +84,18 @@ bool LoadPunctSettings(const std::string& path, value* settings) {
 // Fills in default model paths; false with a message when one is missing.
 bool ResolveModels(TranscribeOptions* o) {
   const std::string models = DefaultModelsDir();
-  if (o->decoder_model.empty()) o->decoder_model = models.empty() ? "" : models + "/decoder/en-us.manifest";
+  if (o->decoder_model.empty())
+    o->decoder_model = models.empty() ? "" : models + "/decoder/en-us.manifest";
   if (o->vad_dir.empty()) o->vad_dir = models.empty() ? "" : models + "/vad";
   if (o->punct && o->punct_settings.empty()) {
     o->punct_settings = models.empty() ? "" : models + "/punct/en/settings.json";
   }
-  if (!IsFile(o->decoder_model)) {
-    std::fprintf(stderr, "kvasr: decoder model '%s' not found (use --model)\n", o->decoder_model.c_str());
+  if (!kvasr_common::IsFile(o->decoder_model)) {
+    std::fprintf(stderr, "kvasr: decoder model '%s' not found (use --model)\n",
+                 o->decoder_model.c_str());
     return false;
   }
-  if (o->vad && !IsDirectory(o->vad_dir)) {
+  if (o->vad && !kvasr_common::IsDirectory(o->vad_dir)) {
     std::fprintf(stderr, "kvasr: VAD model folder '%s' not found (use --vad-models or --no-vad)\n",
                  o->vad_dir.c_str());
     return false;
@@ -133,8 +137,8 @@ bool TranscribeOne(void* engine, const std::string& input, const TranscribeOptio
     return false;
   }
   const size_t chunk_samples = static_cast<size_t>(o.chunk_ms) * kSamplesPerMs;
-  const bool show_progress = o.progress && isatty(STDERR_FILENO) &&
-                             audio->duration_s() > kProgressMinDurationS;
+  const bool show_progress =
+      o.progress && isatty(STDERR_FILENO) && audio->duration_s() > kProgressMinDurationS;
   Progress progress(input, audio->duration_s(), show_progress);
 
   // One chunk of look-ahead, so that the last chunk can be marked as such.
@@ -147,8 +151,8 @@ bool TranscribeOne(void* engine, const std::string& input, const TranscribeOptio
     ok = audio->Read(chunk_samples, &next);
     if (!ok) break;
     const int marker = next.empty() ? -1 : packet++;
-    if (vorta_speech_offline_asr_process_sound_data(engine, current.data(),
-                                                    static_cast<int>(current.size()), marker) != 0) {
+    if (vorta_speech_offline_asr_process_sound_data(
+            engine, current.data(), static_cast<int>(current.size()), marker) != 0) {
       if (listener->timed_out) break;  // the listening period ended itself
       std::fprintf(stderr, "kvasr: %s: the engine refused the audio\n", input.c_str());
       ok = false;
@@ -175,7 +179,8 @@ int RunTranscribe(const TranscribeOptions& options, FILE* out) {
   if (o.punct && !LoadPunctSettings(o.punct_settings, &punct_settings)) return 2;
 
   void* engine = vorta_speech_create_offline_asr_engine();
-  if (vorta_speech_offline_asr_init(engine, InitParams(o, o.punct ? &punct_settings : nullptr).c_str()) != 0) {
+  if (vorta_speech_offline_asr_init(
+          engine, InitParams(o, o.punct ? &punct_settings : nullptr).c_str()) != 0) {
     std::fprintf(stderr,
                  "kvasr: the models could not be loaded (decoder model '%s'%s%s); "
                  "run with --verbose for the library's log\n",

@@ -6,6 +6,7 @@
 #include <memory>
 
 #include "audio_source.h"
+#include "file_kind.h"
 #include "model_paths.h"
 #include "quellan_conf.h"
 #include "vad_plot.h"
@@ -34,8 +35,7 @@ void PrintSegments(const VadRunResult& run, const std::string& prefix, FILE* out
 void PrintFrames(const VadRunResult& run, const std::string& prefix, FILE* out) {
   for (size_t f = 0; f < run.frames.size(); ++f) {
     const VadFrame& v = run.frames[f];
-    std::fprintf(out, "%s%zu\t%d\t%.4f\t%d\n", prefix.c_str(), f, v.speech, v.smoothed,
-                 v.emitted);
+    std::fprintf(out, "%s%zu\t%d\t%.4f\t%d\n", prefix.c_str(), f, v.speech, v.smoothed, v.emitted);
   }
 }
 
@@ -52,8 +52,8 @@ bool Dump(const VadRunResult& run, const std::string& dir, const std::string& st
   frames << "frame\tscore\tsmoothed\tenergy\tspeech\temitted\n";
   for (size_t f = 0; f < run.frames.size(); ++f) {
     const VadFrame& v = run.frames[f];
-    frames << f << '\t' << v.score << '\t' << v.smoothed << '\t' << int{v.energy_speech}
-           << '\t' << int{v.speech} << '\t' << int{v.emitted} << '\n';
+    frames << f << '\t' << v.score << '\t' << v.smoothed << '\t' << int{v.energy_speech} << '\t'
+           << int{v.speech} << '\t' << int{v.emitted} << '\n';
   }
   std::ofstream stats(base + ".stats", std::ios::trunc);
   stats.precision(9);
@@ -72,22 +72,20 @@ bool Dump(const VadRunResult& run, const std::string& dir, const std::string& st
 int RunVadCommand(VadOptions o, FILE* out) {
   if (o.vad_dir.empty()) {
     const std::string models = DefaultModelsDir();
-    o.vad_dir = models.empty() ? std::string(KVASR_SOURCE_MODELS_DIR) + "/vad"
-                               : models + "/vad";
+    o.vad_dir = models.empty() ? std::string(KVASR_SOURCE_MODELS_DIR) + "/vad" : models + "/vad";
   }
   if (!o.plot_path.empty() && o.inputs.size() != 1) {
     std::fputs("kvasr: --plot takes exactly one input\n", stderr);
     return 2;
   }
-  if (!o.dump_dir.empty() && !IsDirectory(o.dump_dir)) {
+  if (!o.dump_dir.empty() && !kvasr_common::IsDirectory(o.dump_dir)) {
     std::fprintf(stderr, "kvasr: '%s' is not a folder\n", o.dump_dir.c_str());
     return 2;
   }
   QuellanConf conf{};
   // The module joins folder and file names into fixed 256-byte fields.
   if (o.vad_dir.size() + sizeof kNetworkFile + 1 > sizeof conf.data_dir ||
-      !IsDirectory(o.vad_dir) ||
-      load_quellan_conf(o.vad_dir.c_str(), &conf) != 0) {
+      !kvasr_common::IsDirectory(o.vad_dir) || load_quellan_conf(o.vad_dir.c_str(), &conf) != 0) {
     std::fprintf(stderr, "kvasr: no usable VAD model folder '%s'\n", o.vad_dir.c_str());
     return 1;
   }

@@ -11,7 +11,7 @@ namespace kvasr_cli {
 
 struct VadOptions {
   std::vector<std::string> inputs;
-  std::string vad_dir;    // empty: the shipped model
+  std::string vad_dir;  // empty: the shipped model
   int chunk_ms = 100;
   bool frames = false;    // one line per frame instead of segments
   std::string plot_path;  // PNG of waveform, score and segments

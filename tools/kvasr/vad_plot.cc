@@ -33,14 +33,12 @@ bool PlotVad(const VadRunResult& run, float threshold, const std::string& title,
   for (size_t f = 0; f < frames; ++f) {
     const auto begin = run.samples.begin() + static_cast<long>(f * kFrameShiftSamples);
     const auto [lo, hi] = std::minmax_element(begin, begin + kFrameShiftSamples);
-    std::fprintf(gp, "%.2f %.5f %.5f\n", f * kFrameSeconds, *lo / kFullScale,
-                 *hi / kFullScale);
+    std::fprintf(gp, "%.2f %.5f %.5f\n", f * kFrameSeconds, *lo / kFullScale, *hi / kFullScale);
   }
   std::fputs("EOD\n$frames << EOD\n", gp);
   for (size_t f = 0; f < run.frames.size(); ++f) {
     const VadFrame& v = run.frames[f];
-    std::fprintf(gp, "%.2f %.4f %d %d\n", f * kFrameSeconds, v.smoothed, v.speech,
-                 v.emitted);
+    std::fprintf(gp, "%.2f %.4f %d %d\n", f * kFrameSeconds, v.smoothed, v.speech, v.emitted);
   }
   std::fputs("EOD\n", gp);
   std::fprintf(gp,

@@ -16,8 +16,7 @@ class FrameRecorder : public VadFrameObserver {
   void on_frame(const VadFrameReport& r) override {
     const size_t frame = static_cast<size_t>(r.frame);
     if (result_->frames.size() <= frame) result_->frames.resize(frame + 1);
-    result_->frames[frame] = VadFrame{r.score, r.smoothed,
-                                      static_cast<uint8_t>(r.energy_speech),
+    result_->frames[frame] = VadFrame{r.score, r.smoothed, static_cast<uint8_t>(r.energy_speech),
                                       static_cast<uint8_t>(r.speech), 0};
     if (!keep_features_) return;
     result_->feat_dim = r.feat_dim;
@@ -38,8 +37,7 @@ class FrameRecorder : public VadFrameObserver {
 // adds no frame repeats the previous call's intervals; those are skipped.
 class SegmentCollector {
  public:
-  explicit SegmentCollector(std::vector<VadSegment>* segments)
-      : segments_(segments) {}
+  explicit SegmentCollector(std::vector<VadSegment>* segments) : segments_(segments) {}
 
   void Take(const Cquellan& pipe) {
     for (int i = 0; i < pipe.emitted_count(); ++i) {
@@ -87,16 +85,15 @@ void AddRunningStatistics(const PLP& plp, VadRunResult* result) {
 
 }  // namespace
 
-bool RunVad(Cquellan* pipe, AudioSource* source, const VadRunOptions& options,
-            VadRunResult* result, std::string* error) {
+bool RunVad(Cquellan* pipe, AudioSource* source, const VadRunOptions& options, VadRunResult* result,
+            std::string* error) {
   *result = VadRunResult{};
   FrameRecorder recorder(result, options.keep_features);
   SegmentCollector segments(&result->segments);
   pipe->set_frame_observer(&recorder);
   std::vector<int16_t> chunk;
   std::vector<int16_t> next;
-  std::vector<int16_t> out(static_cast<size_t>(options.chunk_samples) +
-                           kOutSlackSamples);
+  std::vector<int16_t> out(static_cast<size_t>(options.chunk_samples) + kOutSlackSamples);
   bool ok = source->Read(options.chunk_samples, &chunk);
   int index = 0;
   while (ok && !chunk.empty()) {
@@ -105,10 +102,9 @@ bool RunVad(Cquellan* pipe, AudioSource* source, const VadRunOptions& options,
     ++index;
     const int call_index = next.empty() ? -index : index;
     int out_len = 0, speech = 0, continued = 0, ended = 0;
-    if (pipe->quellan_process(call_index, chunk.data(),
-                              static_cast<int>(chunk.size()), out.data(),
-                              static_cast<int>(out.size()), &out_len, &speech,
-                              &continued, &ended) != 0) {
+    if (pipe->quellan_process(call_index, chunk.data(), static_cast<int>(chunk.size()), out.data(),
+                              static_cast<int>(out.size()), &out_len, &speech, &continued,
+                              &ended) != 0) {
       *error = "the detector failed on chunk " + std::to_string(index);
       pipe->set_frame_observer(nullptr);
       return false;

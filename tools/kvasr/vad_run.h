@@ -47,8 +47,8 @@ struct VadRunOptions {
 
 // Feeds `source` to `pipe` as one utterance. False with `*error` set when
 // the audio cannot be read or a chunk fails.
-bool RunVad(Cquellan* pipe, AudioSource* source, const VadRunOptions& options,
-            VadRunResult* result, std::string* error);
+bool RunVad(Cquellan* pipe, AudioSource* source, const VadRunOptions& options, VadRunResult* result,
+            std::string* error);
 
 }  // namespace kvasr_cli
 

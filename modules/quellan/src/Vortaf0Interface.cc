@@ -13,8 +13,7 @@ constexpr float kRawF0Marker = FLT_MAX;
 
 }  // namespace
 
-Vortaf0Interface::Vortaf0Interface(const PitchConf& conf,
-                                   int /*wave_capacity*/)
+Vortaf0Interface::Vortaf0Interface(const PitchConf& conf, int /*wave_capacity*/)
     : m_tone_dim(conf.tone_dim), m_tone_scale(conf.tone_scale) {
   PitchTrackerInit(&m_tracker);
 }
@@ -24,9 +23,8 @@ void Vortaf0Interface::SetToneFeatureOffset(int base) {
   m_tracker.feature_stride = m_tone_dim + base;
 }
 
-int Vortaf0Interface::ExtractToneFeature(const int16_t* samples, int count,
-                                         float* features, int maxFrames,
-                                         int* framesWritten, float* rawF0,
+int Vortaf0Interface::ExtractToneFeature(const int16_t* samples, int count, float* features,
+                                         int maxFrames, int* framesWritten, float* rawF0,
                                          int rawF0Capacity, int* rawF0Count) {
   PitchTracker* t = &m_tracker;
   int written = 0;
@@ -37,8 +35,7 @@ int Vortaf0Interface::ExtractToneFeature(const int16_t* samples, int count,
   if (t->pending_count > 0) {
     const int taken = std::min(kPitchFrameSamples, count);
     if (t->pending_count + taken >= kPitchFrameSamples) {
-      std::memcpy(t->pending + t->pending_count, samples,
-                  sizeof(int16_t) * taken);
+      std::memcpy(t->pending + t->pending_count, samples, sizeof(int16_t) * taken);
       frame = t->pending;
       from_pending = true;
     }
@@ -46,8 +43,7 @@ int Vortaf0Interface::ExtractToneFeature(const int16_t* samples, int count,
   while (available >= kPitchFrameSamples) {
     if (rawF0 != nullptr) {
       if (raw_count >= rawF0Capacity) {
-        QUELLAN_WARN("Too many frames for raw f0. [%d/%d].\n", raw_count,
-                     rawF0Capacity);
+        QUELLAN_WARN("Too many frames for raw f0. [%d/%d].\n", raw_count, rawF0Capacity);
         return -1;
       }
       rawF0[raw_count] = kRawF0Marker;
@@ -80,26 +76,22 @@ int Vortaf0Interface::ExtractToneFeature(const int16_t* samples, int count,
   return 0;
 }
 
-int Vortaf0Interface::GetToneFeature(int* frameCounter, float* features,
-                                     int maxFrames) {
+int Vortaf0Interface::GetToneFeature(int* frameCounter, float* features, int maxFrames) {
   // Every push is followed by a take, so at most one frame is waiting.
   float ready[kToneValuesPerFrame];
   if (ToneStateTake(&m_tracker.post, ready) == 0) return 0;
   if (*frameCounter >= maxFrames) {
-    QUELLAN_WARN("Two many Frames for tone. [%d/%d].\n", *frameCounter,
-                 maxFrames);
+    QUELLAN_WARN("Two many Frames for tone. [%d/%d].\n", *frameCounter, maxFrames);
     return -1;
   }
-  float* row = features +
-               static_cast<size_t>(*frameCounter) * m_tracker.feature_stride +
+  float* row = features + static_cast<size_t>(*frameCounter) * m_tracker.feature_stride +
                m_tracker.feature_offset;
   for (int d = 0; d < m_tone_dim; ++d) row[d] = ready[d] * m_tone_scale;
   ++*frameCounter;
   return 0;
 }
 
-int Vortaf0Interface::EndToneFeature(float* features, int maxFrames,
-                                     int* framesWritten) {
+int Vortaf0Interface::EndToneFeature(float* features, int maxFrames, int* framesWritten) {
   const int held_back = ToneStatePending(&m_tracker.post);
   int counter = 0;
   for (int i = 0; i < held_back; ++i) {

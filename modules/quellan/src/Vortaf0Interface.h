@@ -30,9 +30,8 @@ class Vortaf0Interface {
   // non-null stores the raw pitch period of every analysed frame (at most
   // `rawF0Capacity`) and their count to `rawF0Count` when that is non-null.
   // Returns 0, or -1 when `rawF0` is full.
-  int ExtractToneFeature(const int16_t* samples, int count, float* features,
-                         int maxFrames, int* framesWritten, float* rawF0,
-                         int rawF0Capacity, int* rawF0Count);
+  int ExtractToneFeature(const int16_t* samples, int count, float* features, int maxFrames,
+                         int* framesWritten, float* rawF0, int rawF0Capacity, int* rawF0Count);
 
   // Moves at most one ready frame to row `*frameCounter` of `features` and
   // advances the counter. Returns 0, or -1 when the row is beyond

@@ -3,19 +3,9 @@
 #include <algorithm>
 #include <cmath>
 #include <cstring>
-#include <new>
-#include <stdexcept>
 
+#include "alloc_zeroed.h"
 #include "quellan_log.h"
-
-namespace {
-
-template <typename T>
-std::unique_ptr<T[]> alloc_zeroed(size_t count) {
-  return std::unique_ptr<T[]>(new (std::nothrow) T[count]());
-}
-
-}  // namespace
 
 Cdnnvad::Cdnnvad(const VadDnnConf& conf)
     : m_max_frames(conf.max_frames),
@@ -32,59 +22,39 @@ Cdnnvad::Cdnnvad(const VadDnnConf& conf)
       m_energy_smooth(conf.energy_smooth),
       m_win_size(conf.win_size),
       m_shift(conf.shift) {
-  if (m_max_frames < 1 || m_shift < 1 || m_win_size < 1 || m_skip < 0 ||
-      m_feat_dim < 1 || m_head_margin < 0 || m_min_silence < 1 ||
-      m_start_offset < 0 || m_end_offset < 0) {
-    QUELLAN_WARN("Invalid detector settings.\n");
-    throw std::runtime_error("init vad failed");
+  if (m_max_frames < 1 || m_shift < 1 || m_win_size < 1 || m_skip < 0 || m_feat_dim < 1 ||
+      m_head_margin < 0 || m_min_silence < 1 || m_start_offset < 0 || m_end_offset < 0) {
+    QUELLAN_INIT_FAIL("Invalid detector settings.\n");
   }
   const size_t frames = static_cast<size_t>(m_max_frames);
   if (m_energy_gate == 1) {
     m_wav = alloc_zeroed<int16_t>(frames * m_shift);
-    if (!m_wav) {
-      QUELLAN_WARN("Failed to alloc memory for m_wav.\n");
-      throw std::runtime_error("init vad failed");
-    }
+    if (!m_wav) QUELLAN_INIT_FAIL("Failed to alloc memory for m_wav.\n");
     m_client_vad_flag = alloc_zeroed<uint8_t>(frames);
-    if (!m_client_vad_flag) {
-      QUELLAN_WARN("Failed to alloc memory for m_client_vad_flag\n");
-      throw std::runtime_error("init vad failed");
-    }
+    if (!m_client_vad_flag) QUELLAN_INIT_FAIL("Failed to alloc memory for m_client_vad_flag\n");
   }
   m_dnn.reset(load_vaddnn_file(conf.dnn_file));
-  if (!m_dnn) {
-    QUELLAN_WARN("Failed to load vad dnn file[%s].\n", conf.dnn_file);
-    throw std::runtime_error("init vad failed");
-  }
-  if (set_vaddnn_params(m_dnn.get(), m_max_frames, m_start_offset,
-                        m_end_offset) != 0) {
-    QUELLAN_WARN("Failed to set_dnn_params\n");
-    throw std::runtime_error("init vad failed");
+  if (!m_dnn) QUELLAN_INIT_FAIL("Failed to load vad dnn file[%s].\n", conf.dnn_file);
+  if (set_vaddnn_params(m_dnn.get(), m_max_frames, m_start_offset, m_end_offset) != 0) {
+    QUELLAN_INIT_FAIL("Failed to set_dnn_params\n");
   }
   if (load_vaddnn_state_weights(m_dnn.get(), conf.state_weights_file) < 0) {
-    QUELLAN_WARN("Failed to load state-weights file[%s].\n",
-                 conf.state_weights_file);
-    throw std::runtime_error("init vad failed");
+    QUELLAN_INIT_FAIL("Failed to load state-weights file[%s].\n", conf.state_weights_file);
   }
   if (!(m_skip_score = alloc_zeroed<float>(frames))) {
-    QUELLAN_WARN("Failed to alloc m_skip_score.\n");
-    throw std::runtime_error("init vad failed");
+    QUELLAN_INIT_FAIL("Failed to alloc m_skip_score.\n");
   }
   if (!(m_out_score = alloc_zeroed<float>(frames))) {
-    QUELLAN_WARN("Failed to alloc m_out_score.\n");
-    throw std::runtime_error("init vad failed");
+    QUELLAN_INIT_FAIL("Failed to alloc m_out_score.\n");
   }
   if (!(m_vad_flag = alloc_zeroed<uint8_t>(frames))) {
-    QUELLAN_WARN("Failed to alloc m_vad_flag.\n");
-    throw std::runtime_error("init vad failed");
+    QUELLAN_INIT_FAIL("Failed to alloc m_vad_flag.\n");
   }
   if (!(m_interval_beg = alloc_zeroed<int>(frames))) {
-    QUELLAN_WARN("Failed to alloc m_interval_beg.\n");
-    throw std::runtime_error("init vad failed");
+    QUELLAN_INIT_FAIL("Failed to alloc m_interval_beg.\n");
   }
   if (!(m_interval_end = alloc_zeroed<int>(frames))) {
-    QUELLAN_WARN("Failed to alloc m_interval_end.\n");
-    throw std::runtime_error("init vad failed");
+    QUELLAN_INIT_FAIL("Failed to alloc m_interval_end.\n");
   }
 }
 
@@ -112,14 +82,14 @@ void Cdnnvad::reset() {
   }
 }
 
-int Cdnnvad::add_wave_data(int index, const int16_t* samples, int len,
-                           const float* feat, int feat_dim, int plp_frames,
-                           int tone_frames, int* consumed,
+int Cdnnvad::add_wave_data(int index, const int16_t* samples, int len, const float* feat,
+                           int feat_dim, int plp_frames, int tone_frames, int* consumed,
                            const VadOutputLists& lists) {
   if (index == 1 || index == -1) reset();
-  if (samples == nullptr || len < 0 || feat == nullptr || feat_dim < 1 ||
-      plp_frames < 0 || tone_frames < 0 || plp_frames > m_max_frames ||
-      tone_frames > m_max_frames || consumed == nullptr) {
+  if (samples == nullptr || len < 0 || feat == nullptr || feat_dim < 1 || plp_frames < 0 ||
+      tone_frames < 0 || plp_frames > m_max_frames || tone_frames > m_max_frames ||
+      consumed == nullptr) {
+    // compat: "Invalide" is the established spelling of this message; hosts match the text.
     QUELLAN_WARN("Invalide input arguments to Cdnnvad::AddWaveData\n");
     return -1;
   }
@@ -127,8 +97,7 @@ int Cdnnvad::add_wave_data(int index, const int16_t* samples, int len,
     const int64_t capacity = static_cast<int64_t>(m_shift) * m_max_frames;
     const int64_t total = static_cast<int64_t>(m_wav_len) + len;
     if (total >= capacity) {
-      QUELLAN_WARN("Wav overflows [%lld] >= [%lld]\n",
-                   static_cast<long long>(total),
+      QUELLAN_WARN("Wav overflows [%lld] >= [%lld]\n", static_cast<long long>(total),
                    static_cast<long long>(capacity));
       return -1;
     }
@@ -170,20 +139,20 @@ int Cdnnvad::add_wave_data(int index, const int16_t* samples, int len,
 
 int Cdnnvad::client_detect_speech(int index, const int16_t* samples, int len) {
   if (samples == nullptr || len < 1) {
+    // compat: "Invalide" is the established spelling of this message; hosts match the text.
     QUELLAN_WARN("Invalide input arguments for client_detect_speech\n");
     return -1;
   }
   const int frames = m_last - m_first + 1;
-  // The accumulator is deliberately not cleared between frames: each
-  // frame's sum starts from the previous frame's level in dB.
+  // Each frame's sum starts from the previous frame's level in dB.
+  // compat: the sum is not cleared between frames; clearing it moves every energy-gate decision.
   float acc = 0.0f;
   for (int j = 0; j < frames; ++j) {
     const int sta = j * m_shift;
     // Audio that never arrived ends the pass; the frames left keep their
     // earlier decisions and the buffer is not advanced.
     if (sta + m_win_size > m_wav_len) {
-      QUELLAN_WARN("Overflows. sta[%d]+m_win_size[%d] m_wav_len[%d]\n", sta,
-                   m_win_size, m_wav_len);
+      QUELLAN_WARN("Overflows. sta[%d]+m_win_size[%d] m_wav_len[%d]\n", sta, m_win_size, m_wav_len);
       return 0;
     }
     const int16_t* window = m_wav.get() + sta;
@@ -193,37 +162,33 @@ int Cdnnvad::client_detect_speech(int index, const int16_t* samples, int len) {
     const float mean = acc / m_win_size;
     if ((index == 1 || index == -1) && j == 0) m_energy = mean;
     m_energy = (1.0f - m_energy_smooth) * mean + m_energy_smooth * m_energy;
-    const float db = static_cast<float>(
-        10.0 * std::log10(static_cast<double>(m_energy) + 1.0));
+    const float db = static_cast<float>(10.0 * std::log10(static_cast<double>(m_energy) + 1.0));
     acc = db;
     m_client_vad_flag[j] = db >= static_cast<float>(m_energy_threshold) ? 1 : 0;
   }
   const int used = frames * m_shift;
-  std::memmove(m_wav.get(), m_wav.get() + used,
-               sizeof(int16_t) * (m_wav_len - used));
+  std::memmove(m_wav.get(), m_wav.get() + used, sizeof(int16_t) * (m_wav_len - used));
   m_wav_len -= used;
   return 0;
 }
 
 int Cdnnvad::detect_speech(const float* feat) {
   m_eval_rel = m_next_eval - m_frame_base;
-  if (set_vaddnn_feature(m_dnn.get(), feat, m_feat_dim, m_eval_rel, m_first,
-                         m_last, m_avail_frames, m_skip, &m_score_num) < 0) {
+  if (set_vaddnn_feature(m_dnn.get(), feat, m_feat_dim, m_eval_rel, m_first, m_last, m_avail_frames,
+                         m_skip, &m_score_num) < 0) {
     QUELLAN_WARN("Failed to set vad dnn feature data.\n");
     return -1;
   }
   // A short batch may hold no frame due for evaluation; its frames then
   // carry the last score like the frames before the first evaluation.
-  if (m_score_num > 0 &&
-      calc_vaddnn_prob(m_dnn.get(), m_score_num, m_skip_score.get()) < 0) {
+  if (m_score_num > 0 && calc_vaddnn_prob(m_dnn.get(), m_score_num, m_skip_score.get()) < 0) {
     QUELLAN_WARN("Failed to calculate vad dnn score.\n");
     return -1;
   }
   fill_frame_scores();
   const int frames = m_last - m_first + 1;
   for (int i = 0; i < frames; ++i) {
-    m_smoothed = (1.0f - m_score_smooth) * m_out_score[i] +
-                 m_score_smooth * m_smoothed;
+    m_smoothed = (1.0f - m_score_smooth) * m_out_score[i] + m_score_smooth * m_smoothed;
     const bool loud = m_energy_gate != 1 || m_client_vad_flag[i] == 1;
     const bool speech = m_smoothed > m_threshold && loud;
     m_vad_flag[i] = speech ? 1 : 0;
@@ -244,17 +209,16 @@ void Cdnnvad::fill_frame_scores() {
     for (int s = 0; s <= m_skip; ++s) out[f + s] = m_skip_score[n];
     f += m_skip + 1;
   }
+  // compat: reset() keeps m_last_score; clearing it changes each later utterance's first scores.
   if (m_score_num > 0) m_last_score = m_skip_score[m_score_num - 1];
   for (; f <= m_last; ++f) out[f] = m_last_score;
 }
 
-void Cdnnvad::report_frame(const float* feat, int i, bool energy_speech,
-                           bool speech) const {
+void Cdnnvad::report_frame(const float* feat, int i, bool energy_speech, bool speech) const {
   const int row = m_first + i;
-  m_observer->on_frame(VadFrameReport{
-      m_frame_base + row, feat + static_cast<size_t>(row) * m_feat_dim,
-      m_feat_dim, m_out_score[i], m_smoothed, energy_speech ? 1 : 0,
-      speech ? 1 : 0});
+  m_observer->on_frame(
+      VadFrameReport{m_frame_base + row, feat + static_cast<size_t>(row) * m_feat_dim, m_feat_dim,
+                     m_out_score[i], m_smoothed, energy_speech ? 1 : 0, speech ? 1 : 0});
 }
 
 void Cdnnvad::find_intervals() {
@@ -287,12 +251,10 @@ void Cdnnvad::open_interval(int begin, const VadOutputLists& lists) {
   // The caller emits the latest interval; when the lists are full the
   // oldest one makes room.
   if (*lists.seg_num >= lists.capacity) {
-    QUELLAN_WARN("Too many intervals in one call, [%d, %d] dropped.\n",
-                 lists.seg_beg[0], lists.seg_end[0]);
-    std::memmove(lists.seg_beg, lists.seg_beg + 1,
-                 sizeof(int) * (lists.capacity - 1));
-    std::memmove(lists.seg_end, lists.seg_end + 1,
-                 sizeof(int) * (lists.capacity - 1));
+    QUELLAN_WARN("Too many intervals in one call, [%d, %d] dropped.\n", lists.seg_beg[0],
+                 lists.seg_end[0]);
+    std::memmove(lists.seg_beg, lists.seg_beg + 1, sizeof(int) * (lists.capacity - 1));
+    std::memmove(lists.seg_end, lists.seg_end + 1, sizeof(int) * (lists.capacity - 1));
     *lists.seg_num = lists.capacity - 1;
   }
   lists.seg_beg[*lists.seg_num] = begin;
@@ -310,8 +272,7 @@ void Cdnnvad::segment_before_first_interval(const VadOutputLists& lists) {
       m_silence = 0;
     } else {
       m_in_speech = 1;
-      open_interval(std::max(0, base + m_interval_beg[0] - m_head_margin),
-                    lists);
+      open_interval(std::max(0, base + m_interval_beg[0] - m_head_margin), lists);
     }
     return;
   }
@@ -326,9 +287,8 @@ void Cdnnvad::segment_before_first_interval(const VadOutputLists& lists) {
   }
   // The silence carried over plus this batch's lead closes the segment.
   const int seg_end = base - m_silence;
-  const int cut = m_interval_num == 0
-                      ? base + (frames - m_silence) / 2
-                      : base + (first_speech + 1 - m_silence) / 2;
+  const int cut = m_interval_num == 0 ? base + (frames - m_silence) / 2
+                                      : base + (first_speech + 1 - m_silence) / 2;
   cut_at(cut, lists);
   open_interval(seg_end, lists);
   close_interval(cut, lists);
@@ -336,8 +296,7 @@ void Cdnnvad::segment_before_first_interval(const VadOutputLists& lists) {
     m_in_speech = 0;
     m_silence = 0;
   } else {
-    open_interval(std::max(seg_end + 1, base + first_speech - m_head_margin),
-                  lists);
+    open_interval(std::max(seg_end + 1, base + first_speech - m_head_margin), lists);
   }
 }
 
@@ -346,9 +305,8 @@ void Cdnnvad::segment_between_intervals(const VadOutputLists& lists) {
   for (int i = 1; i < m_interval_num; ++i) {
     const int prev_end = m_interval_end[i - 1];
     const int next_beg = m_interval_beg[i];
-    // The gap holds next_beg - prev_end non-speech frames; the + 1 makes a
-    // gap inside one batch close a segment one frame sooner than silence
-    // counted across calls. Established behaviour, kept on purpose.
+    // The gap holds next_beg - prev_end non-speech frames.
+    // compat: + 1 closes an in-batch gap a frame sooner than across calls; dropping it moves ends.
     if (next_beg - prev_end + 1 < m_min_silence) continue;
     const int cut = base + prev_end + (next_beg - prev_end - 1) / 2;
     cut_at(cut, lists);

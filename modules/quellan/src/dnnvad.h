@@ -13,13 +13,13 @@ constexpr int kVadPathBytes = 256;
 
 struct VadDnnConf {
   int32_t max_frames;
-  int32_t head_margin;   // frames put before the first speech frame
-  int32_t min_silence;   // non-speech frames that close a segment
-  int32_t energy_gate;   // 1: the energy decision must agree as well
+  int32_t head_margin;  // frames put before the first speech frame
+  int32_t min_silence;  // non-speech frames that close a segment
+  int32_t energy_gate;  // 1: the energy decision must agree as well
   float energy_threshold_db;
-  int32_t win_size;      // energy window, samples
-  int32_t shift;         // energy frame shift, samples
-  float energy_smooth;   // weight of the previous smoothed energy
+  int32_t win_size;     // energy window, samples
+  int32_t shift;        // energy frame shift, samples
+  float energy_smooth;  // weight of the previous smoothed energy
   char dnn_file[kVadPathBytes];
   char state_weights_file[kVadPathBytes];
   int32_t feat_dim;
@@ -46,10 +46,10 @@ struct VadFrameReport {
   int frame;              // absolute frame of the utterance
   const float* features;  // the frame's feature row (feat_dim floats)
   int feat_dim;
-  float score;            // network score the frame carries
-  float smoothed;         // smoothed score the decision compares
-  int energy_speech;      // energy gate's decision, 1 without the gate
-  int speech;             // the frame's decision
+  float score;        // network score the frame carries
+  float smoothed;     // smoothed score the decision compares
+  int energy_speech;  // energy gate's decision, 1 without the gate
+  int speech;         // the frame's decision
 };
 
 // Sees every frame once, in order, as the detector decides it. Used to
@@ -70,9 +70,8 @@ class Cdnnvad {
   // are ready; `index` 1 or -1 starts an utterance, below 1 ends it. Sets
   // `*consumed` to the rows the caller may drop and returns it, or -1.
   // A chunk that completes no frame leaves `lists` untouched.
-  int add_wave_data(int index, const int16_t* samples, int len,
-                    const float* feat, int feat_dim, int plp_frames,
-                    int tone_frames, int* consumed, const VadOutputLists& lists);
+  int add_wave_data(int index, const int16_t* samples, int len, const float* feat, int feat_dim,
+                    int plp_frames, int tone_frames, int* consumed, const VadOutputLists& lists);
 
   // Null (the default) switches observation off; the caller keeps the
   // observer alive while it is set.
@@ -88,8 +87,7 @@ class Cdnnvad {
   int detect_speech(const float* feat);
   void fill_frame_scores();
   void find_intervals();
-  void report_frame(const float* feat, int i, bool energy_speech,
-                    bool speech) const;
+  void report_frame(const float* feat, int i, bool energy_speech, bool speech) const;
   void segment_before_first_interval(const VadOutputLists& lists);
   void segment_between_intervals(const VadOutputLists& lists);
   void segment_after_last_interval(const VadOutputLists& lists);

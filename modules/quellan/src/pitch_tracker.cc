@@ -12,7 +12,6 @@ constexpr int kInitialFill = 20;  // every stream starts 2.5 ms late
 constexpr int kDecimatedSamples = kPitchFrameSamples / 2;
 constexpr int kResetAnalysisSamples = 140;
 constexpr int kFftSize = 256;
-constexpr int kLastBin = kPowerBins - 1;
 // The window's 2 pi is the single-precision constant, widened.
 constexpr double kTwoPi = 6.2831854820251465;
 constexpr double kMinEnergy = 0.00019284;
@@ -33,8 +32,7 @@ const RealFft& transform_fft() {
 // 256-point DFT of the windowed 200 samples (the other 56 are zero) by an
 // iterative radix-2 FFT, bins 1 .. 128 in the transform layout;
 // X[k] = sum x[n] exp(-2 pi i k n / 256).
-void Transform(const float* analysis, const float* window,
-               float transform[kTransformFloats]) {
+void Transform(const float* analysis, const float* window, float transform[kTransformFloats]) {
   double x[kFftSize] = {};
   for (int n = 0; n < kAnalysisSamples; ++n) {
     x[n] = static_cast<double>(analysis[n]) * window[n];
@@ -99,8 +97,7 @@ void FrameDecision(PitchTracker* t, float* raw_f0) {
   FilterForPitch(&t->voicing, restart, a, filtered);
   PitchTrackingUpdate(&t->tracking, transform, spectral_level);
 
-  const float log_energy =
-      energy < kMinEnergy ? kSilentLogEnergy : std::log(energy);
+  const float log_energy = energy < kMinEnergy ? kSilentLogEnergy : std::log(energy);
   float f0 = 0.0f;
   if (voiced == 1 && log_energy >= kMinPitchLogEnergy) {
     if (restart != 0) t->tracking.distrust_frames = kRestartDistrustFrames;
@@ -116,12 +113,9 @@ void FrameDecision(PitchTracker* t, float* raw_f0) {
 
 void PitchMelEdges(int edges[kMelEdges]) {
   for (int j = 0; j < kMelEdges; ++j) {
-    const float mel =
-        (static_cast<float>(j) / (kMelEdges - 1) * kMelSpan + kMelLow) /
-        kMelDivisor;
-    edges[j] = static_cast<int>(std::floor(
-        (std::pow(10.0, static_cast<double>(mel)) - 1.0) * kMelCornerBins +
-        0.5));
+    const float mel = (static_cast<float>(j) / (kMelEdges - 1) * kMelSpan + kMelLow) / kMelDivisor;
+    edges[j] = static_cast<int>(
+        std::floor((std::pow(10.0, static_cast<double>(mel)) - 1.0) * kMelCornerBins + 0.5));
   }
 }
 
@@ -131,8 +125,8 @@ void PitchTrackerInit(PitchTracker* t) {
   t->fill = kInitialFill;
   for (int i = 0; i < kAnalysisSamples; ++i) {
     // The half-sample offset keeps both ends of the window above zero.
-    t->window[i] = static_cast<float>(
-        0.5 * (1.0 - std::cos((i + 0.5) * kTwoPi / kAnalysisSamples)));
+    t->window[i] =
+        static_cast<float>(0.5 * (1.0 - std::cos((i + 0.5) * kTwoPi / kAnalysisSamples)));
   }
   int b[kMelEdges];
   PitchMelEdges(b);
@@ -142,8 +136,7 @@ void PitchTrackerInit(PitchTracker* t) {
     const int rise = b[j + 1] - b[j] + 1;
     const int fall = b[j + 2] - b[j + 1] + 1;
     for (int i = 1; i <= rise; ++i) {
-      t->mel_weights[j][b[j] + i - 1] =
-          static_cast<float>(i) / static_cast<float>(rise);
+      t->mel_weights[j][b[j] + i - 1] = static_cast<float>(i) / static_cast<float>(rise);
     }
     for (int i = 0; i <= fall - 2; ++i) {
       t->mel_weights[j][b[j + 1] + i + 1] =
@@ -184,6 +177,5 @@ void AnalyseFrame(PitchTracker* t, const int16_t* frame, float* raw_f0) {
   FrameDecision(t, raw_f0);
   // Analysis windows overlap by 120 samples: drop the oldest 80.
   t->fill -= kDecimatedSamples;
-  std::memmove(t->analysis, t->analysis + kDecimatedSamples,
-               sizeof(float) * t->fill);
+  std::memmove(t->analysis, t->analysis + kDecimatedSamples, sizeof(float) * t->fill);
 }

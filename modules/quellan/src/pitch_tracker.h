@@ -11,8 +11,8 @@
 #include "tone_post.h"
 #include "voicing_detector.h"
 
-constexpr int kPitchFrameSamples = 160;     // 10 ms at 16 kHz
-constexpr int kPendingSamples = 320;        // room for two frames
+constexpr int kPitchFrameSamples = 160;      // 10 ms at 16 kHz
+constexpr int kPendingSamples = 320;         // room for two frames
 constexpr int kAnalysisBufferSamples = 280;  // decimated, 8 kHz
 constexpr int kMelEdges = kMelBands + 2;
 

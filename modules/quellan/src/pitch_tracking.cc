@@ -10,7 +10,6 @@ namespace {
 
 constexpr float kBinHz = kPitchSampleRateHz / 256.0f;  // 256-point transform
 constexpr float kFilteredRateHz = 2000.0f;
-constexpr int kLastBin = kPowerBins - 1;
 
 // Candidate grid, log-spaced so that every octave is resolved alike.
 constexpr float kMinF0Hz = 60.0f;
@@ -98,9 +97,8 @@ void Correlations(const float* x, float* out) {
 }
 
 float CorrelationAt(const float* correlations, float f0_hz) {
-  const float lag = std::clamp(kFilteredRateHz / f0_hz,
-                               static_cast<float>(kMinLag),
-                               static_cast<float>(kMaxLag));
+  const float lag =
+      std::clamp(kFilteredRateHz / f0_hz, static_cast<float>(kMinLag), static_cast<float>(kMaxLag));
   const int i = std::min(static_cast<int>(lag), kMaxLag - 1) - kMinLag;
   const float frac = lag - (i + kMinLag);
   return correlations[i] + frac * (correlations[i + 1] - correlations[i]);
@@ -152,12 +150,9 @@ float RefineFromCorrelation(const float* correlations, float f0_hz) {
 
 }  // namespace
 
-void PitchTrackingReset(PitchTrackingState* s) {
-  std::memset(s, 0, sizeof(*s));
-}
+void PitchTrackingReset(PitchTrackingState* s) { std::memset(s, 0, sizeof(*s)); }
 
-void PitchTrackingUpdate(PitchTrackingState* s,
-                         const float transform[kTransformFloats],
+void PitchTrackingUpdate(PitchTrackingState* s, const float transform[kTransformFloats],
                          float /*spectral_level*/) {
   s->amplitude[0] = 0.0f;
   for (int k = 1; k < kLastBin; ++k) {
@@ -174,8 +169,7 @@ void PitchTrackingBreak(PitchTrackingState* s) {
   s->track_frames = 0;
 }
 
-float PitchTrackingEstimate(PitchTrackingState* s,
-                            const float power[kPowerBins],
+float PitchTrackingEstimate(PitchTrackingState* s, const float power[kPowerBins],
                             const float filtered_2khz[kPitchSamples2kHz]) {
   float salience[kGridPoints];
   float best_salience = 0.0f;
@@ -192,8 +186,8 @@ float PitchTrackingEstimate(PitchTrackingState* s,
   int peaks[kMaxCandidates];
   int peak_count = 0;
   for (int i = 1; i + 1 < kGridPoints; ++i) {
-    if (salience[i] < kMinRelativeSalience * best_salience ||
-        salience[i] < salience[i - 1] || salience[i] < salience[i + 1]) {
+    if (salience[i] < kMinRelativeSalience * best_salience || salience[i] < salience[i - 1] ||
+        salience[i] < salience[i + 1]) {
       continue;
     }
     int pos = std::min(peak_count, kMaxCandidates - 1);
@@ -218,10 +212,8 @@ float PitchTrackingEstimate(PitchTrackingState* s,
     const float left = salience[i - 1];
     const float right = salience[i + 1];
     const float curvature = left - 2.0f * salience[i] + right;
-    const float offset =
-        curvature < 0.0f ? 0.5f * (left - right) / curvature : 0.0f;
-    candidate_hz[candidate_count] =
-        GridFrequency(i) * std::exp2(offset / kGridStepsPerOctave);
+    const float offset = curvature < 0.0f ? 0.5f * (left - right) / curvature : 0.0f;
+    candidate_hz[candidate_count] = GridFrequency(i) * std::exp2(offset / kGridStepsPerOctave);
     candidate_salience[candidate_count++] = salience[i];
   }
 
@@ -232,15 +224,14 @@ float PitchTrackingEstimate(PitchTrackingState* s,
   int best_lag = 0;
   for (int lag = kMinLag + 1; lag < kMaxLag; ++lag) {
     const float r = correlations[lag - kMinLag];
-    if (r >= correlations[lag - 1 - kMinLag] &&
-        r >= correlations[lag + 1 - kMinLag] &&
+    if (r >= correlations[lag - 1 - kMinLag] && r >= correlations[lag + 1 - kMinLag] &&
         (best_lag == 0 || r > correlations[best_lag - kMinLag])) {
       best_lag = lag;
     }
   }
   if (best_lag != 0) {
-    const float f0_hz = RefineFromCorrelation(
-        correlations, kFilteredRateHz / static_cast<float>(best_lag));
+    const float f0_hz =
+        RefineFromCorrelation(correlations, kFilteredRateHz / static_cast<float>(best_lag));
     if (f0_hz >= kMinF0Hz && f0_hz <= kMaxF0Hz) {
       candidate_hz[candidate_count] = f0_hz;
       candidate_salience[candidate_count++] = Salience(s->amplitude, f0_hz);
@@ -252,8 +243,7 @@ float PitchTrackingEstimate(PitchTrackingState* s,
     return 0.0f;
   }
 
-  const bool trusted = s->distrust_frames == 0 &&
-                       s->track_frames >= kTrackFramesForTrust &&
+  const bool trusted = s->distrust_frames == 0 && s->track_frames >= kTrackFramesForTrust &&
                        s->tracked_period > 0.0f;
   const float tracked_hz = trusted ? kPitchSampleRateHz / s->tracked_period : 0.0f;
   float best_hz = 0.0f;
@@ -263,8 +253,7 @@ float PitchTrackingEstimate(PitchTrackingState* s,
     float score = candidate_salience[c] / best_salience +
                   kCorrelationWeight * CorrelationAt(correlations, f0_hz);
     if (trusted) {
-      const float distance =
-          std::fabs(std::log(f0_hz / tracked_hz)) / std::log(kContinuityRatio);
+      const float distance = std::fabs(std::log(f0_hz / tracked_hz)) / std::log(kContinuityRatio);
       score += kContinuityBonus * std::max(0.0f, 1.0f - distance);
     }
     if (best_hz == 0.0f || score > best_score) {

@@ -17,9 +17,9 @@ constexpr int32_t kRestartDistrustFrames = 19;
 
 // Plain record, part of the tracker block.
 struct PitchTrackingState {
-  int32_t distrust_frames;  // analysed frames left before the track counts
-  int32_t track_frames;     // consecutive frames with an estimate
-  float tracked_period;     // last estimate in 8 kHz samples, 0 without
+  int32_t distrust_frames;      // analysed frames left before the track counts
+  int32_t track_frames;         // consecutive frames with an estimate
+  float tracked_period;         // last estimate in 8 kHz samples, 0 without
   float amplitude[kPowerBins];  // |X[k]| of the latest analysed frame
 };
 
@@ -28,8 +28,7 @@ void PitchTrackingReset(PitchTrackingState* s);
 
 // Takes in every analysed frame's transform output. `spectral_level` is
 // accepted as the frame driver computes it; this method does not need it.
-void PitchTrackingUpdate(PitchTrackingState* s,
-                         const float transform[kTransformFloats],
+void PitchTrackingUpdate(PitchTrackingState* s, const float transform[kTransformFloats],
                          float spectral_level);
 
 // Ends the track: the next estimate starts without continuity.
@@ -38,8 +37,7 @@ void PitchTrackingBreak(PitchTrackingState* s);
 // Estimates the pitch of the frame last given to PitchTrackingUpdate from its
 // power spectrum and the 80 low-pass samples at 2 kHz. Returns the period in
 // samples of the 8 kHz signal, or 0 when no candidate is periodic enough.
-float PitchTrackingEstimate(PitchTrackingState* s,
-                            const float power[kPowerBins],
+float PitchTrackingEstimate(PitchTrackingState* s, const float power[kPowerBins],
                             const float filtered_2khz[kPitchSamples2kHz]);
 
 #endif  // QUELLAN_PITCH_TRACKING_H_

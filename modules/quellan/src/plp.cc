@@ -4,9 +4,8 @@
 #include <cmath>
 #include <cstring>
 #include <limits>
-#include <new>
-#include <stdexcept>
 
+#include "alloc_zeroed.h"
 #include "quellan_log.h"
 
 namespace {
@@ -17,9 +16,14 @@ constexpr float kStaticClip = 50.0f;
 constexpr int kDeltaWindowFrames = 2;
 constexpr float kDeltaDivisor = 10.0f;  // 2 * (1^2 + 2^2)
 constexpr float kFilterbankFloor = 1.0f;
-constexpr double kMinStdDev = 0.01;
 
-double mel(double hz) { return 1127.0 * std::log(1.0 + hz / 700.0); }
+// The mel scale, with frequencies also given as multiples of its corner.
+constexpr double kMelScale = 1127.0;
+constexpr double kMelCornerHz = 700.0;
+
+double mel_of_corners(double corners) { return kMelScale * std::log(1.0 + corners); }
+double mel(double hz) { return mel_of_corners(hz / kMelCornerHz); }
+double hz_of_mel(double m) { return kMelCornerHz * (std::exp(m / kMelScale) - 1.0); }
 
 float clip_static(float v) {
   return v > kStaticClip ? kStaticClip : (v < -kStaticClip ? -kStaticClip : v);
@@ -28,32 +32,24 @@ float clip_static(float v) {
 }  // namespace
 
 PLP::PLP(const PlpConfig* conf, FILE* cmsfp) {
-  if (load_base_info_cmsfp(this, conf, cmsfp) != 0) {
-    QUELLAN_WARN("Failed to load base info\n");
-    throw std::runtime_error("init vad failed");
-  }
+  if (load_base_info_cmsfp(this, conf, cmsfp) != 0) QUELLAN_INIT_FAIL("Failed to load base info\n");
   build_tables();
-  const size_t tgt_floats =
-      static_cast<size_t>(conf_.feat_dim) * conf_.max_frame_num;
-  m_tgt_.reset(new (std::nothrow) float[tgt_floats]());
+  const size_t tgt_floats = static_cast<size_t>(conf_.feat_dim) * conf_.max_frame_num;
+  m_tgt_ = alloc_zeroed<float>(tgt_floats);
   if (!m_tgt_) {
-    QUELLAN_WARN("Failed to alloc memory for m_tgt, size[%lu]\n",
-                 static_cast<unsigned long>(tgt_floats * sizeof(float)));
-    throw std::runtime_error("init vad failed");
+    QUELLAN_INIT_FAIL("Failed to alloc memory for m_tgt, size[%lu]\n",
+                      static_cast<unsigned long>(tgt_floats * sizeof(float)));
   }
-  const size_t static_floats =
-      static_cast<size_t>(static_dim_) * conf_.max_frame_num;
-  static_buf_.reset(new (std::nothrow) float[static_floats]());
+  const size_t static_floats = static_cast<size_t>(static_dim_) * conf_.max_frame_num;
+  static_buf_ = alloc_zeroed<float>(static_floats);
   if (!static_buf_) {
-    QUELLAN_WARN("Failed to alloc memory for m_tgt, size[%lu]\n",
-                 static_cast<unsigned long>(static_floats * sizeof(float)));
-    throw std::runtime_error("init vad failed");
+    // compat: names m_tgt, as this message always has; hosts match the text.
+    QUELLAN_INIT_FAIL("Failed to alloc memory for m_tgt, size[%lu]\n",
+                      static_cast<unsigned long>(static_floats * sizeof(float)));
   }
 }
 
-int PLP::delay_frames() const {
-  return kDeltaWindowFrames * (conf_.feat_dim / static_dim_ - 1);
-}
+int PLP::delay_frames() const { return kDeltaWindowFrames * (conf_.feat_dim / static_dim_ - 1); }
 
 void PLP::build_tables() {
   fft_n_ = 2;
@@ -61,21 +57,20 @@ void PLP::build_tables() {
   const int half_n = fft_n_ / 2;
   const int num_chans = conf_.num_chans;
 
-  const double bin_mel_step = 1e7 / (conf_.src_period * fft_n_ * 700.0);
+  // One bin's width, in multiples of the mel scale's corner frequency.
+  const double bin_corners = 1e7 / (conf_.src_period * fft_n_ * kMelCornerHz);
   double mlo = 0.0;
   first_bin_ = 2;
   if (conf_.lo_freq >= 0.0f) {
     mlo = mel(conf_.lo_freq);
-    first_bin_ = static_cast<int>(conf_.lo_freq * conf_.src_period * 1e-7 *
-                                      fft_n_ + 0.5);
+    first_bin_ = static_cast<int>(conf_.lo_freq * conf_.src_period * 1e-7 * fft_n_ + 0.5);
     if (first_bin_ < 2) first_bin_ = 2;
   }
   double mhi = mel(0.5e7 / conf_.src_period);
   last_bin_ = half_n;
   if (conf_.hi_freq >= 0.0f) {
     mhi = mel(conf_.hi_freq);
-    last_bin_ = static_cast<int>(conf_.hi_freq * conf_.src_period * 1e-7 *
-                                     fft_n_ + 0.5);
+    last_bin_ = static_cast<int>(conf_.hi_freq * conf_.src_period * 1e-7 * fft_n_ + 0.5);
     if (last_bin_ > half_n) last_bin_ = half_n;
   }
 
@@ -87,12 +82,11 @@ void PLP::build_tables() {
   std::vector<int> bin_chan(half_n + 1, 0);
   bin_weight_.assign(half_n + 1, 0.0f);
   for (int k = first_bin_; k <= last_bin_; ++k) {
-    const double m = 1127.0 * std::log(1.0 + (k - 1) * bin_mel_step);
+    const double m = mel_of_corners((k - 1) * bin_corners);
     int ch = 0;
     while (ch + 1 <= num_chans + 1 && centre[ch + 1] < m) ++ch;
     bin_chan[k] = ch;
-    bin_weight_[k] = static_cast<float>((centre[ch + 1] - m) /
-                                        (centre[ch + 1] - centre[ch]));
+    bin_weight_[k] = static_cast<float>((centre[ch + 1] - m) / (centre[ch + 1] - centre[ch]));
   }
   // Channels rise with the bin, so each one's bins form a range; walking
   // down leaves the first bin at or above every channel.
@@ -103,11 +97,10 @@ void PLP::build_tables() {
 
   loudness_.assign(num_chans + 1, 0.0f);
   for (int j = 1; j <= num_chans; ++j) {
-    const double f = 700.0 * (std::exp(centre[j] / 1127.0) - 1.0);
+    const double f = hz_of_mel(centre[j]);
     const double s = f * f;
     const double ratio = s / (s + 1.6e5);
-    loudness_[j] =
-        static_cast<float>(ratio * ratio * (s + 1.44e6) / (s + 9.61e6));
+    loudness_[j] = static_cast<float>(ratio * ratio * (s + 1.44e6) / (s + 9.61e6));
   }
 
   const int n_freq = num_chans + 2;
@@ -119,8 +112,7 @@ void PLP::build_tables() {
     for (int j = 1; j <= n_freq - 2; ++j) {
       idft_cos_[static_cast<size_t>(j) * lags + k] = 2.0 * std::cos(j * step);
     }
-    idft_cos_[static_cast<size_t>(n_freq - 1) * lags + k] =
-        std::cos((n_freq - 1) * step);
+    idft_cos_[static_cast<size_t>(n_freq - 1) * lags + k] = std::cos((n_freq - 1) * step);
   }
   lag_sums_.assign(lags, 0.0);
 
@@ -133,8 +125,8 @@ void PLP::build_tables() {
   }
   hamming_.assign(frame_size_ + 1, 0.0f);
   for (int i = 1; i <= frame_size_; ++i) {
-    hamming_[i] = static_cast<float>(
-        0.54 - 0.46 * std::cos(2.0 * M_PI * (i - 1) / (frame_size_ - 1)));
+    hamming_[i] =
+        static_cast<float>(0.54 - 0.46 * std::cos(2.0 * M_PI * (i - 1) / (frame_size_ - 1)));
   }
 
   fft_ = std::make_unique<RealFft>(fft_n_);
@@ -148,18 +140,16 @@ void PLP::build_tables() {
   cep_.assign(static_dim_ + 1, 0.0f);
 }
 
-int PLP::AddWaveData(const int16_t* waveData, int smpNum,
-                     int64_t first_sample) {
+int PLP::AddWaveData(const int16_t* waveData, int smpNum, int64_t first_sample) {
   if (m_bInitialize_ != 1 || waveData == nullptr || smpNum <= 0) {
     QUELLAN_WARN("Null m_bInitialize[%lx] or waveData[%p] or smpNum[%d]\n",
-                 static_cast<unsigned long>(m_bInitialize_),
-                 static_cast<const void*>(waveData), smpNum);
+                 static_cast<unsigned long>(m_bInitialize_), static_cast<const void*>(waveData),
+                 smpNum);
     return -1;
   }
   frame_num_ = (smpNum - frame_size_) / frame_shift_ + 1;
   if (frame_num_ >= conf_.max_frame_num) {
-    QUELLAN_WARN("Too many frames[%d] >= max_frame_num[%d]\n", frame_num_,
-                 conf_.max_frame_num);
+    QUELLAN_WARN("Too many frames[%d] >= max_frame_num[%d]\n", frame_num_, conf_.max_frame_num);
     return -1;
   }
   const int kept = take_over_kept_frames(first_sample, smpNum);
@@ -175,8 +165,7 @@ int PLP::AddWaveData(const int16_t* waveData, int smpNum,
     const int16_t* samples = waveData + static_cast<size_t>(t) * frame_shift_;
     // A block shorter than one window still counts one frame (the frame
     // count truncates toward zero); its missing samples read as zeros.
-    const int available =
-        std::min(frame_size_, smpNum - t * frame_shift_);
+    const int available = std::min(frame_size_, smpNum - t * frame_shift_);
     for (int i = available; i < frame_size_; ++i) frame_[i + 1] = 0.0f;
     for (int i = 0; i < available; ++i) {
       if (conf_.zero_mean_src) {
@@ -199,11 +188,10 @@ int PLP::take_over_kept_frames(int64_t first_sample, int smpNum) {
   const int64_t offset_frames = offset_samples / frame_shift_;
   // Only whole frames repeat: a block shorter than a window pads its frame.
   const int whole_frames = smpNum >= frame_size_ ? frame_num_ : 0;
-  const int count = static_cast<int>(
-      std::clamp<int64_t>(kept_frames_ - offset_frames, 0, whole_frames));
+  const int count =
+      static_cast<int>(std::clamp<int64_t>(kept_frames_ - offset_frames, 0, whole_frames));
   if (count == 0) return 0;
-  std::memmove(static_buf_.get(),
-               static_buf_.get() + offset_frames * static_dim_,
+  std::memmove(static_buf_.get(), static_buf_.get() + offset_frames * static_dim_,
                sizeof(float) * static_cast<size_t>(count) * static_dim_);
   return count;
 }
@@ -238,8 +226,8 @@ void PLP::analyse_frame(float* cepstrum) {
   const int n_freq = num_chans + 2;
   for (int j = 1; j <= num_chans; ++j) {
     const float band = std::max(fbank_[j], kFilterbankFloor);
-    aud_spec_[j + 1] = static_cast<float>(
-        std::pow(static_cast<double>(band * loudness_[j]), conf_.compress_fact));
+    aud_spec_[j + 1] =
+        static_cast<float>(std::pow(static_cast<double>(band * loudness_[j]), conf_.compress_fact));
   }
   aud_spec_[1] = aud_spec_[2];
   aud_spec_[n_freq] = aud_spec_[n_freq - 1];
@@ -266,9 +254,8 @@ void PLP::analyse_frame(float* cepstrum) {
   if (tgt_kind_ & kTargetKindC0) {
     // A vanishing prediction error drives C0 to the clip floor rather than
     // to a NaN that would poison the running statistics.
-    c[static_dim_] = err > 0.0f
-                         ? static_cast<float>(-std::log(1.0 / err))
-                         : -std::numeric_limits<float>::infinity();
+    c[static_dim_] = err > 0.0f ? static_cast<float>(-std::log(1.0 / err))
+                                : -std::numeric_limits<float>::infinity();
   }
   if (conf_.cep_lifter > 0) {
     for (int i = 1; i <= conf_.num_ceps; ++i) c[i] *= lifter_[i];
@@ -293,9 +280,8 @@ float PLP::durbin(float energy) {
   return err;
 }
 
-int PLP::extract_feature(const int16_t* wave, int smpNum, float* out,
-                         int max_out_frames, int* out_frames, int flag,
-                         int64_t first_sample) {
+int PLP::extract_feature(const int16_t* wave, int smpNum, float* out, int max_out_frames,
+                         int* out_frames, int flag, int64_t first_sample) {
   if (AddWaveData(wave, smpNum, first_sample) != 0) {
     QUELLAN_WARN("Failed to add wave data.\n");
     return -1;
@@ -309,8 +295,7 @@ int PLP::extract_feature(const int16_t* wave, int smpNum, float* out,
   }
   add_derivatives(frames);
   if (feat_dim / static_dim_ >= 2) {
-    if ((flag == -1 && smpNum <= conf_.online_max_samples) ||
-        conf_.cms_mode == 0) {
+    if ((flag == -1 && smpNum <= conf_.online_max_samples) || conf_.cms_mode == 0) {
       normalise_block(frames);
     } else {
       normalise_running(frames, flag);
@@ -323,8 +308,7 @@ int PLP::extract_feature(const int16_t* wave, int smpNum, float* out,
   const int stride = feat_dim + conf_.out_pad;
   for (int t = 0; t < frames; ++t) {
     std::memcpy(out + static_cast<size_t>(t) * stride,
-                m_tgt_.get() + static_cast<size_t>(t) * feat_dim,
-                sizeof(float) * feat_dim);
+                m_tgt_.get() + static_cast<size_t>(t) * feat_dim, sizeof(float) * feat_dim);
   }
   *out_frames = frames;
   // After the last block the caller may start over at the same positions.

@@ -28,8 +28,7 @@ class PLP {
 
   // Frames and analyses one block into the static cepstra, taking over the
   // frames that extract_feature kept at the same positions (see there).
-  int AddWaveData(const int16_t* waveData, int smpNum,
-                  int64_t first_sample = kNoPosition);
+  int AddWaveData(const int16_t* waveData, int smpNum, int64_t first_sample = kNoPosition);
 
   // Writes one normalised feature vector per frame of the block to `out`
   // (stride feat_dim + out_pad). `flag` >= 1 while more audio follows, below
@@ -39,9 +38,8 @@ class PLP {
   // are kept, and the next block takes over the frames at the same positions
   // instead of analysing them again. The caller must not change the samples
   // at a position within an utterance. Returns 0 or -1.
-  int extract_feature(const int16_t* wave, int smpNum, float* out,
-                      int max_out_frames, int* out_frames, int flag,
-                      int64_t first_sample = kNoPosition);
+  int extract_feature(const int16_t* wave, int smpNum, float* out, int max_out_frames,
+                      int* out_frames, int flag, int64_t first_sample = kNoPosition);
 
   int frame_shift_samples() const { return frame_shift_; }
   int window_samples() const { return frame_size_; }
@@ -61,6 +59,10 @@ class PLP {
   const std::vector<float>& running_variance() const { return run_var_; }
 
  private:
+  // Floor of a standard deviation that divides a normalised feature: both
+  // normalisations use it, the running one at single precision.
+  static constexpr double kMinStdDev = 0.01;
+
   friend int load_base_info_cmsfp(PLP* plp, const PlpConfig* conf, FILE* cmsfp);
 
   void build_tables();
@@ -116,7 +118,7 @@ class PLP {
   // whole frames follow it there.
   int64_t kept_start_ = kNoPosition;
   int kept_frames_ = 0;
-  std::unique_ptr<float[]> m_tgt_;       // feat_dim x max_frame_num
+  std::unique_ptr<float[]> m_tgt_;  // feat_dim x max_frame_num
 
   // Cepstral mean table and the running statistics seeded from it.
   int cms_dim_ = 0;

@@ -13,7 +13,6 @@ constexpr float kRunningRate = 0.01f;
 constexpr float kRunningKeep = 0.99f;
 // 0.99 * 0.01: the weight of the squared deviation from the previous mean.
 constexpr float kRunningVarRate = 0.0099f;
-constexpr float kMinStdDev = 0.01f;
 
 }  // namespace
 
@@ -37,17 +36,14 @@ int load_base_info_cmsfp(PLP* plp, const PlpConfig* conf, FILE* cmsfp) {
     return -1;
   }
   if (conf->cms_mode != 0 && conf->cms_mode != 1) {
-    QUELLAN_WARN("CMS Mode invalid, should be 0 or 1, you set: %d\n",
-                 conf->cms_mode);
+    QUELLAN_WARN("CMS Mode invalid, should be 0 or 1, you set: %d\n", conf->cms_mode);
     return -1;
   }
-  plp->static_dim_ =
-      conf->num_ceps + ((plp->tgt_kind_ & kTargetKindC0) ? 1 : 0);
+  plp->static_dim_ = conf->num_ceps + ((plp->tgt_kind_ & kTargetKindC0) ? 1 : 0);
   // Frame geometry and vector widths that the analysis relies on.
   if (conf->src_period <= 0 || conf->frame_period < conf->src_period ||
-      conf->window_size < 2 * conf->src_period || conf->num_chans < 1 ||
-      conf->max_frame_num < 1 || conf->out_pad < 0 ||
-      conf->feat_dim < plp->static_dim_ ||
+      conf->window_size < 2 * conf->src_period || conf->num_chans < 1 || conf->max_frame_num < 1 ||
+      conf->out_pad < 0 || conf->feat_dim < plp->static_dim_ ||
       conf->feat_dim % plp->static_dim_ != 0) {
     QUELLAN_WARN("Invalid frame or vector settings.\n");
     return -1;
@@ -85,8 +81,10 @@ int load_base_info_cmsfp(PLP* plp, const PlpConfig* conf, FILE* cmsfp) {
   for (uint32_t i = 0; i < dim; ++i) {
     if (!std::isfinite(plp->cms_mean_[i]) || !std::isfinite(plp->cms_var_[i]) ||
         plp->cms_var_[i] < 0.0f) {
-      QUELLAN_WARN("read cms table error: dimension %u is not a finite mean and "
-                   "variance\n", i);
+      QUELLAN_WARN(
+          "read cms table error: dimension %u is not a finite mean and "
+          "variance\n",
+          i);
       return -1;
     }
   }
@@ -94,15 +92,15 @@ int load_base_info_cmsfp(PLP* plp, const PlpConfig* conf, FILE* cmsfp) {
 }
 
 void PLP::update_running(float* vector) {
+  const float min_sd = static_cast<float>(kMinStdDev);
   for (int i = 0; i < cms_dim_; ++i) {
     const float x = vector[i];
     const float mean = run_mean_[i];
     const float deviation = x - mean;
     const float new_mean = kRunningRate * x + kRunningKeep * mean;
-    const float new_var =
-        kRunningKeep * run_var_[i] + kRunningVarRate * deviation * deviation;
+    const float new_var = kRunningKeep * run_var_[i] + kRunningVarRate * deviation * deviation;
     float sd = std::sqrt(new_var);
-    if (sd < kMinStdDev) sd = kMinStdDev;
+    if (sd < min_sd) sd = min_sd;
     vector[i] = (x - new_mean) / sd;
     run_mean_[i] = new_mean;
     run_var_[i] = new_var;

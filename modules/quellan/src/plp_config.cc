@@ -10,8 +10,7 @@ void plp_set_defaults(PlpConfig* conf, int32_t max_frame_num, const char* dir) {
   conf->max_frame_num = max_frame_num;
   std::snprintf(conf->targetkind, sizeof(conf->targetkind), "%s", "MFCCPLP_C0");
   if (dir != nullptr) {
-    std::snprintf(conf->cms_path, sizeof(conf->cms_path), "%s/%s", dir,
-                  kCmsTableFile);
+    std::snprintf(conf->cms_path, sizeof(conf->cms_path), "%s/%s", dir, kCmsTableFile);
   } else {
     std::snprintf(conf->cms_path, sizeof(conf->cms_path), "%s", kCmsTableFile);
   }
@@ -41,12 +40,10 @@ void plp_set_defaults(PlpConfig* conf, int32_t max_frame_num, const char* dir) {
   conf->out_pad = 0;
 }
 
-int plp_load_conf(PlpConfig* conf, int32_t max_frame_num, const char* dir,
-                  const char* file) {
+int plp_load_conf(PlpConfig* conf, int32_t max_frame_num, const char* dir, const char* file) {
   (void)file;
   if (conf == nullptr) {
-    QUELLAN_WARN("Wrong param to %s. %p\n", __func__,
-                 static_cast<void*>(conf));
+    QUELLAN_WARN("Wrong param to %s. %p\n", __func__, static_cast<void*>(conf));
     return -1;
   }
   plp_set_defaults(conf, max_frame_num, dir);

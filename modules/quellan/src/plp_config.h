@@ -52,7 +52,6 @@ void plp_set_defaults(PlpConfig* conf, int32_t max_frame_num, const char* dir);
 
 // Fills the record with its defaults. `file` names a settings file for a
 // reader that this system does not have; it is accepted and ignored.
-int plp_load_conf(PlpConfig* conf, int32_t max_frame_num, const char* dir,
-                  const char* file);
+int plp_load_conf(PlpConfig* conf, int32_t max_frame_num, const char* dir, const char* file);
 
 #endif  // QUELLAN_PLP_CONFIG_H_

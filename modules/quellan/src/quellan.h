@@ -8,9 +8,9 @@
 #include <memory>
 #include <vector>
 
+#include "Vortaf0Interface.h"
 #include "dnnvad.h"
 #include "plp.h"
-#include "Vortaf0Interface.h"
 #include "quellan_conf.h"
 
 class Cquellan {
@@ -30,9 +30,8 @@ class Cquellan {
   // 1 or -1 starts one, a negative value ends it. Writes the samples of the
   // last interval of the call to `out` (at most `out_capacity`) and its
   // flags; returns 0, or -1 when the chunk fails (outputs stay 0).
-  int quellan_process(int index, const int16_t* samples, int len, int16_t* out,
-                      int out_capacity, int* out_len, int* speech,
-                      int* continued, int* ended);
+  int quellan_process(int index, const int16_t* samples, int len, int16_t* out, int out_capacity,
+                      int* out_len, int* speech, int* continued, int* ended);
 
   // Prepares the next utterance; the detector resets itself on index 1/-1.
   int reset();
@@ -42,9 +41,7 @@ class Cquellan {
   Interval emitted(int i) const;
 
   // See Cdnnvad::set_frame_observer.
-  void set_frame_observer(VadFrameObserver* observer) {
-    m_vad->set_frame_observer(observer);
-  }
+  void set_frame_observer(VadFrameObserver* observer) { m_vad->set_frame_observer(observer); }
   const PLP& feature_extractor() const { return *m_plp; }
 
  private:
@@ -56,8 +53,7 @@ class Cquellan {
   // Limits samples [begin, end) of the utterance to those the ring holds.
   void clip_to_history(int64_t* begin, int64_t* end) const;
   // Copies samples [begin, end), at most `capacity`; returns the count.
-  int copy_history(int64_t begin, int64_t end, int16_t* dst,
-                   int capacity) const;
+  int copy_history(int64_t begin, int64_t end, int16_t* dst, int capacity) const;
 
   int m_max_frames;
   std::unique_ptr<int16_t[]> wav_reserve;  // audio not yet turned into rows
@@ -73,8 +69,8 @@ class Cquellan {
   int m_plp_delay = 0;
   int m_use_tone = 0;
   std::unique_ptr<Vortaf0Interface> m_tone;  // null without tone features
-  int m_tone_dim = 0;                         // tone columns per row
-  int m_tone_frames = 0;                      // rows that hold tone values
+  int m_tone_dim = 0;                        // tone columns per row
+  int m_tone_frames = 0;                     // rows that hold tone values
   std::unique_ptr<Cdnnvad> m_vad;
   // Ring of the latest audio at its position in the utterance; long enough
   // for every interval the detector can still report.

@@ -51,8 +51,7 @@ int load_quellan_conf(const char* dir, QuellanConf* conf) {
   conf->use_pitch = 0;
   conf->out_wav_len = 32000;
   conf->out_wav_num = 5;
-  std::snprintf(conf->data_dir, sizeof(conf->data_dir), "%s",
-                dir != nullptr ? dir : "./data");
+  std::snprintf(conf->data_dir, sizeof(conf->data_dir), "%s", dir != nullptr ? dir : "./data");
   if (plp_load_conf(&conf->plp, conf->max_frames, dir, nullptr) < 0) {
     QUELLAN_WARN("Failed to load plp conf.\n");
     return -1;

@@ -9,13 +9,11 @@ void* quellan_create(const char* dir) {
   return new Cquellan(conf);
 }
 
-int quellan_process_wave(void* handle, int index, const int16_t* samples,
-                         int len, int16_t* out, int out_capacity, int* out_len,
-                         int* speech, int* continued, int* ended) {
+int quellan_process_wave(void* handle, int index, const int16_t* samples, int len, int16_t* out,
+                         int out_capacity, int* out_len, int* speech, int* continued, int* ended) {
   if (handle == nullptr) return 0;
-  static_cast<Cquellan*>(handle)->quellan_process(
-      index, samples, len, out, out_capacity, out_len, speech, continued,
-      ended);
+  static_cast<Cquellan*>(handle)->quellan_process(index, samples, len, out, out_capacity, out_len,
+                                                  speech, continued, ended);
   return 0;
 }
 

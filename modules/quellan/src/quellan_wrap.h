@@ -29,9 +29,8 @@ void* quellan_create(const char* dir);
  * earlier call, `*ended` when the segment closes in this call. The caller
  * presets the four outputs to 0; a chunk that fails internally leaves them
  * so. Always returns 0. */
-int quellan_process_wave(void* handle, int index, const int16_t* samples,
-                         int len, int16_t* out, int out_capacity, int* out_len,
-                         int* speech, int* continued, int* ended);
+int quellan_process_wave(void* handle, int index, const int16_t* samples, int len, int16_t* out,
+                         int out_capacity, int* out_len, int* speech, int* continued, int* ended);
 
 /* Prepares the handle for a new utterance. */
 void quellan_reset(void* handle);

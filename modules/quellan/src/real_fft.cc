@@ -4,7 +4,7 @@
 
 #include <cmath>
 
-#include "cpu_features.h"
+#include "cpu_dispatch.h"
 
 RealFft::RealFft(int fft_n)
     : fft_n_(fft_n),
@@ -76,16 +76,14 @@ namespace {
 // Four doubles at any double-aligned address; the AVX build of
 // butterflies() keeps them in one register, the default build in two.
 typedef double Lanes
-    __attribute__((vector_size(4 * sizeof(double)), aligned(sizeof(double)),
-                   may_alias));
+    __attribute__((vector_size(4 * sizeof(double)), aligned(sizeof(double)), may_alias));
 
 // One stage's butterflies on a group of 2 * half values, half a multiple
 // of four. Built twice, for AVX and for the baseline: the lanes do the same
 // multiplications, additions and subtractions as scalar butterflies, so
 // both builds give the same results.
-__attribute__((always_inline)) inline void butterflies(
-    double* re_a, double* im_a, int half, const double* tw_re,
-    const double* tw_im) {
+__attribute__((always_inline)) inline void butterflies(double* re_a, double* im_a, int half,
+                                                       const double* tw_re, const double* tw_im) {
   double* re_b = re_a + half;
   double* im_b = im_a + half;
   for (int k = 0; k < half; k += 4) {
@@ -105,8 +103,9 @@ __attribute__((always_inline)) inline void butterflies(
 }
 
 // All stages after the first two, over n values.
-__attribute__((always_inline)) inline void butterfly_stages(
-    int n, double* re, double* im, const double* tw_re, const double* tw_im) {
+__attribute__((always_inline)) inline void butterfly_stages(int n, double* re, double* im,
+                                                            const double* tw_re,
+                                                            const double* tw_im) {
   for (int len = 8; len <= n; len <<= 1) {
     const int half = len / 2;
     for (int start = 0; start < n; start += len) {
@@ -115,8 +114,8 @@ __attribute__((always_inline)) inline void butterfly_stages(
   }
 }
 
-__attribute__((target("avx"))) void later_stages_avx(
-    int n, double* re, double* im, const double* tw_re, const double* tw_im) {
+__attribute__((target("avx"))) void later_stages_avx(int n, double* re, double* im,
+                                                     const double* tw_re, const double* tw_im) {
   butterfly_stages(n, re, im, tw_re, tw_im);
 }
 
@@ -128,8 +127,10 @@ void later_stages_baseline(int n, double* re, double* im, const double* tw_re,
 }  // namespace
 
 void RealFft::later_stages(double* re, double* im) const {
-  (cpu_has_avx() ? later_stages_avx : later_stages_baseline)(
-      fft_n_, re, im, twiddle_re_.data(), twiddle_im_.data());
+  if (kvasr_common::HasAvx()) {
+    return later_stages_avx(fft_n_, re, im, twiddle_re_.data(), twiddle_im_.data());
+  }
+  later_stages_baseline(fft_n_, re, im, twiddle_re_.data(), twiddle_im_.data());
 }
 
 // The trimmed arithmetic of the first stages only drops additions of zero
@@ -150,12 +151,11 @@ void RealFft::magnitude(const float* frame, float* magnitude) {
   // Four bins at a time: the conversions, products, sum and square root
   // round exactly as the scalar ones below.
   for (; k + 4 <= bins; k += 4) {
-    const __m128 re4 = _mm_movelh_ps(_mm_cvtpd_ps(_mm_loadu_pd(re + k)),
-                                     _mm_cvtpd_ps(_mm_loadu_pd(re + k + 2)));
-    const __m128 im4 = _mm_movelh_ps(_mm_cvtpd_ps(_mm_loadu_pd(im + k)),
-                                     _mm_cvtpd_ps(_mm_loadu_pd(im + k + 2)));
-    const __m128 power =
-        _mm_add_ps(_mm_mul_ps(re4, re4), _mm_mul_ps(im4, im4));
+    const __m128 re4 =
+        _mm_movelh_ps(_mm_cvtpd_ps(_mm_loadu_pd(re + k)), _mm_cvtpd_ps(_mm_loadu_pd(re + k + 2)));
+    const __m128 im4 =
+        _mm_movelh_ps(_mm_cvtpd_ps(_mm_loadu_pd(im + k)), _mm_cvtpd_ps(_mm_loadu_pd(im + k + 2)));
+    const __m128 power = _mm_add_ps(_mm_mul_ps(re4, re4), _mm_mul_ps(im4, im4));
     _mm_storeu_ps(magnitude + k, _mm_sqrt_ps(power));
   }
   for (; k < bins; ++k) {

@@ -66,8 +66,7 @@ int ChainPick(RunEntry* entries, int* count) {
     int last = first;
     float sum = entries[first].energy;
     while (last + 1 < *count &&
-           Within(kPitchNeighbourRatio, entries[last].pitch,
-                  entries[last + 1].pitch)) {
+           Within(kPitchNeighbourRatio, entries[last].pitch, entries[last + 1].pitch)) {
       ++last;
       sum += entries[last].energy;
     }
@@ -91,8 +90,7 @@ float OctaveFold(float pc, float h) {
   const float hi = up ? h : pc;
   const float lo = up ? pc : h;
   int n = static_cast<int>(hi / lo);
-  const float e1 =
-      up ? (h - n * pc) / (n * pc + h) : (pc - n * h) / (n * pc + h);
+  const float e1 = up ? (h - n * pc) / (n * pc + h) : (pc - n * h) / (n * pc + h);
   const float e2 = ((n + 1) * lo - hi) / ((n + 1) * lo + hi);
   float e = e1;
   if (e1 > e2) {
@@ -138,16 +136,13 @@ float RepairMiddle(const float* w) {
     const float mean = (a + b) / 2;
     return Within(kPitchNeighbourRatio, mean, m) ? m : mean;
   }
-  if (a != 0.0f && b != 0.0f && m == 0.0f &&
-      Within(kPitchNeighbourRatio, a, b)) {
+  if (a != 0.0f && b != 0.0f && m == 0.0f && Within(kPitchNeighbourRatio, a, b)) {
     return (a + b) / 2;
   }
-  if (a == 0.0f && m != 0.0f && b != 0.0f &&
-      !Within(kPitchNeighbourRatio, m, b)) {
+  if (a == 0.0f && m != 0.0f && b != 0.0f && !Within(kPitchNeighbourRatio, m, b)) {
     return 0.0f;
   }
-  if (a != 0.0f && m != 0.0f && b == 0.0f &&
-      !Within(kPitchNeighbourRatio, a, m)) {
+  if (a != 0.0f && m != 0.0f && b == 0.0f && !Within(kPitchNeighbourRatio, a, m)) {
     return 0.0f;
   }
   return m;
@@ -166,11 +161,10 @@ float InterpolateGap(ToneState* s) {
   while (k < kInterpLookAhead && w[k] == 0.0f) ++k;
   if (w[1] == 0.0f) {
     const float target = w[k] != 0.0f ? w[k] : kReferenceHz;
-    if (std::fabs(x0 - kReferenceHz) > 0.1f &&
-        std::fabs(target - kReferenceHz) < 1e-6f && k == kInterpLookAhead) {
+    if (std::fabs(x0 - kReferenceHz) > 0.1f && std::fabs(target - kReferenceHz) < 1e-6f &&
+        k == kInterpLookAhead) {
       const float next = x0 + s->slope;
-      const bool nearer =
-          std::fabs(next - kReferenceHz) < std::fabs(x0 - kReferenceHz);
+      const bool nearer = std::fabs(next - kReferenceHz) < std::fabs(x0 - kReferenceHz);
       w[1] = nearer ? next : x0;
     } else {
       s->slope = (target - x0) / k;
@@ -199,16 +193,13 @@ float NonZeroMean(const float (&window)[N]) {
 
 // Writes the centre value of the window and its first three regression
 // derivatives.
-void Derivatives(const float (&window)[kToneDeltaFrames],
-                 float out[kToneValuesPerFrame]) {
+void Derivatives(const float (&window)[kToneDeltaFrames], float out[kToneValuesPerFrame]) {
   float rows[kDeltaOrders + 1][kToneDeltaFrames] = {};
   std::memcpy(rows[0], window, sizeof(window));
   for (int r = 1; r <= kDeltaOrders; ++r) {
     const float* prev = rows[r - 1];
     for (int j = 2 * r; j < kToneDeltaFrames - 2 * r; ++j) {
-      rows[r][j] =
-          (2 * (prev[j + 2] - prev[j - 2]) + (prev[j + 1] - prev[j - 1])) /
-          10.0f;
+      rows[r][j] = (2 * (prev[j + 2] - prev[j - 2]) + (prev[j + 1] - prev[j - 1])) / 10.0f;
     }
   }
   for (int r = 0; r <= kDeltaOrders; ++r) out[r] = rows[r][kDeltaCentre];
@@ -226,8 +217,7 @@ void ToneStateReset(ToneState* s) {
   std::memset(s, 0, sizeof(*s));
   s->out_base = out_base;
   s->delay = kToneDelayFrames;
-  std::fill(std::begin(s->energy_win), std::end(s->energy_win),
-            kSilentLogEnergy);
+  std::fill(std::begin(s->energy_win), std::end(s->energy_win), kSilentLogEnergy);
 }
 
 void ToneStatePush(ToneState* s, float pitch_period, float log_energy) {
@@ -264,18 +254,15 @@ int ToneStateTake(ToneState* s, float* dst) {
   return frames;
 }
 
-int ToneStatePending(const ToneState* s) {
-  return std::min(s->pushed, s->delay);
-}
+int ToneStatePending(const ToneState* s) { return std::min(s->pushed, s->delay); }
 
 int ToneStateFlush(ToneState* s, float* dst) {
   if (s->pushed < s->delay) s->delay = s->pushed;
   int taken = 0;
   for (int i = 0; i < s->delay; ++i) {
     ToneStatePush(s, 0.0f, kSilentLogEnergy);
-    float* at = dst != nullptr ? dst + s->out_base +
-                                     (s->out_base + kToneValuesPerFrame) * i
-                               : nullptr;
+    float* at =
+        dst != nullptr ? dst + s->out_base + (s->out_base + kToneValuesPerFrame) * i : nullptr;
     taken += ToneStateTake(s, at);
   }
   ToneStateReset(s);

@@ -36,12 +36,11 @@ struct VadDnn {
 VadDnn* load_vaddnn_file(const char* name);
 int load_all_dnn_layers(VadDnn* dnn, FILE* f);
 int load_vaddnn_state_weights(VadDnn* dnn, const char* name);
-int set_vaddnn_params(VadDnn* dnn, int max_frames, int start_offset,
-                      int end_offset);
+int set_vaddnn_params(VadDnn* dnn, int max_frames, int start_offset, int end_offset);
 // Splices the context window of every (skip + 1)-th frame from t0 while it
 // lies in [first, last]; rows outside [0, total) repeat the edge row.
-int set_vaddnn_feature(VadDnn* dnn, const float* feat, int feat_dim, int t0,
-                       int first, int last, int total, int skip, int* rows);
+int set_vaddnn_feature(VadDnn* dnn, const float* feat, int feat_dim, int t0, int first, int last,
+                       int total, int skip, int* rows);
 // Writes one score per spliced row: log posterior of speech minus log
 // posterior of non-speech, both divided by their priors. Returns rows.
 int calc_vaddnn_prob(VadDnn* dnn, int rows, float* score);

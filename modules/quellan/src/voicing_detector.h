@@ -7,6 +7,7 @@
 
 constexpr int kMelBands = 23;
 constexpr int kPowerBins = 129;
+constexpr int kLastBin = kPowerBins - 1;
 constexpr int kAnalysisSamples = 200;
 constexpr int kPitchSamples2kHz = 80;
 constexpr int kFilteredHistorySamples = 320;
@@ -45,14 +46,12 @@ int DetectVoicing(VoicingState* s, const float mel_energies[kMelBands]);
 
 // Updates the low/high balance from an unvoiced frame's power spectrum and
 // frame energy. Returns 1 when low frequencies dominate, else 0.
-int DetectRestart(VoicingState* s, int voiced, const float power[kPowerBins],
-                  float energy);
+int DetectRestart(VoicingState* s, int voiced, const float power[kPowerBins], float energy);
 
 // Low-pass filters the newest 80 of the 200 decimated samples (all 200 on the
 // first frame) and writes the last 40 ms at 2 kHz to `out_2khz`. Call after
 // DetectVoicing of the same frame.
-void FilterForPitch(VoicingState* s, int restart,
-                    const float analysis[kAnalysisSamples],
+void FilterForPitch(VoicingState* s, int restart, const float analysis[kAnalysisSamples],
                     float out_2khz[kPitchSamples2kHz]);
 
 #endif  // QUELLAN_VOICING_DETECTOR_H_

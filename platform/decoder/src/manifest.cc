@@ -7,6 +7,7 @@
 #include <cstring>
 #include <map>
 
+#include "file_kind.h"
 #include "kvasr_decoder_constants.h"
 
 namespace kvasr::decoder {
@@ -19,15 +20,14 @@ constexpr char kOptionPrefix[] = "option.";
 
 // Options that the manifest's own keys set, or that this library fixes
 // (16 kHz input, logging), so that a manifest cannot contradict itself.
-constexpr const char* kReservedOptions[] = {
-    "hmm", "dict", "fdict", "lm", "lmctl", "lmname", "jsgf", "fsg",
-    "kws", "keyphrase", "allphone", "logfn", "samprate"};
+constexpr const char* kReservedOptions[] = {"hmm",      "dict",  "fdict",   "lm",  "lmctl",
+                                            "lmname",   "jsgf",  "fsg",     "kws", "keyphrase",
+                                            "allphone", "logfn", "samprate"};
 
 // Files the recogniser's acoustic model loader needs, checked here so that
 // a missing one is named: the loader fails without saying which, and ends
 // the whole process when the mixture weights are missing.
-constexpr const char* kAcousticModelFiles[] = {"mdef", "means", "variances",
-                                               "transition_matrices"};
+constexpr const char* kAcousticModelFiles[] = {"mdef", "means", "variances", "transition_matrices"};
 // Mixture weights come in one of two forms.
 constexpr const char* kMixtureWeightFiles[] = {"sendump", "mixture_weights"};
 
@@ -36,16 +36,6 @@ std::string Trim(const std::string& s) {
   const size_t first = s.find_first_not_of(kSpace);
   if (first == std::string::npos) return "";
   return s.substr(first, s.find_last_not_of(kSpace) - first + 1);
-}
-
-bool IsRegularFile(const std::string& path) {
-  struct stat st;
-  return stat(path.c_str(), &st) == 0 && S_ISREG(st.st_mode);
-}
-
-bool IsDirectory(const std::string& path) {
-  struct stat st;
-  return stat(path.c_str(), &st) == 0 && S_ISDIR(st.st_mode);
 }
 
 // Path of the file behind `file`, or nothing. Only a FILE* is given, so the
@@ -57,8 +47,7 @@ std::optional<std::string> PathOf(FILE* file) {
   const std::string link = "/proc/self/fd/" + std::to_string(fd);
   char buffer[4096];
   const ssize_t length = readlink(link.c_str(), buffer, sizeof buffer);
-  if (length <= 0 || static_cast<size_t>(length) >= sizeof buffer ||
-      buffer[0] != '/') {
+  if (length <= 0 || static_cast<size_t>(length) >= sizeof buffer || buffer[0] != '/') {
     return std::nullopt;
   }
   const std::string path(buffer, static_cast<size_t>(length));
@@ -151,8 +140,9 @@ class Parser {
       const std::string name = key.substr(strlen(kOptionPrefix));
       for (const char* reserved : kReservedOptions) {
         if (name == reserved) {
-          Fail(line_number, "option \"" + name + "\" is set by this library "
-                            "or by a manifest key, not as an option");
+          Fail(line_number, "option \"" + name +
+                                "\" is set by this library "
+                                "or by a manifest key, not as an option");
           return false;
         }
       }
@@ -163,9 +153,8 @@ class Parser {
       settings_.options.emplace_back(name, value);
       return true;
     }
-    static const char* const kKnownKeys[] = {
-        "acoustic_model", "dictionary", "filler_dictionary",
-        "language_model", "grammar", "log"};
+    static const char* const kKnownKeys[] = {"acoustic_model", "dictionary", "filler_dictionary",
+                                             "language_model", "grammar",    "log"};
     for (const char* known : kKnownKeys) {
       if (key == known) return true;
     }
@@ -195,7 +184,7 @@ class Parser {
 
   bool ResolveFile(const std::string& key, std::string* path) const {
     if (!Resolve(key, path)) return false;
-    if (!path->empty() && !IsRegularFile(*path)) {
+    if (!path->empty() && !kvasr_common::IsFile(*path)) {
       Fail(entries_.at(key).line, key + " \"" + *path + "\" is not a readable file");
       return false;
     }
@@ -211,8 +200,7 @@ class Parser {
     if (entries_.count("language_model") + entries_.count("grammar") != 1) {
       return Fail(0, "exactly one of \"language_model\" and \"grammar\" is needed");
     }
-    if (!Resolve("acoustic_model", &settings_.acoustic_model_dir) ||
-        !CheckAcousticModel() ||
+    if (!Resolve("acoustic_model", &settings_.acoustic_model_dir) || !CheckAcousticModel() ||
         !ResolveFile("dictionary", &settings_.dictionary) ||
         !ResolveFile("filler_dictionary", &settings_.filler_dictionary) ||
         !ResolveFile("language_model", &settings_.language_model) ||
@@ -232,21 +220,22 @@ class Parser {
   bool CheckAcousticModel() const {
     const std::string& dir = settings_.acoustic_model_dir;
     const int line = entries_.at("acoustic_model").line;
-    if (!IsDirectory(dir)) {
+    if (!kvasr_common::IsDirectory(dir)) {
       Fail(line, "acoustic_model \"" + dir + "\" is not a directory");
       return false;
     }
     for (const char* name : kAcousticModelFiles) {
-      if (!IsRegularFile(dir + "/" + name)) {
+      if (!kvasr_common::IsFile(dir + "/" + name)) {
         Fail(line, "acoustic model \"" + dir + "\" has no file \"" + name + "\"");
         return false;
       }
     }
     for (const char* name : kMixtureWeightFiles) {
-      if (IsRegularFile(dir + "/" + name)) return true;
+      if (kvasr_common::IsFile(dir + "/" + name)) return true;
     }
-    Fail(line, "acoustic model \"" + dir + "\" has neither \"sendump\" nor "
-               "\"mixture_weights\"");
+    Fail(line, "acoustic model \"" + dir +
+                   "\" has neither \"sendump\" nor "
+                   "\"mixture_weights\"");
     return false;
   }
 
@@ -279,9 +268,8 @@ std::optional<ModelSettings> ReadManifest(FILE* file) {
   while ((got = fread(chunk, 1, sizeof chunk, file)) > 0) {
     text.append(chunk, got);
     if (text.size() > kMaxManifestBytes) {
-      ReportError("model manifest " + path.value_or("(path unknown)") +
-                  ": larger than " + std::to_string(kMaxManifestBytes) +
-                  " bytes, not a manifest");
+      ReportError("model manifest " + path.value_or("(path unknown)") + ": larger than " +
+                  std::to_string(kMaxManifestBytes) + " bytes, not a manifest");
       return std::nullopt;
     }
   }

@@ -114,8 +114,7 @@ KVASR_DECODER_EXPORT int mwStartDecode(void* decoder) {
   return Guarded("mwStartDecode", [&] { return AsRecognizer(decoder)->Start(); });
 }
 
-KVASR_DECODER_EXPORT int mwSetData(void* decoder, const int16_t* samples, int64_t count,
-                                   int last) {
+KVASR_DECODER_EXPORT int mwSetData(void* decoder, const int16_t* samples, int64_t count, int last) {
   return Delivering("mwSetData", decoder, [&](Recognizer* recognizer) {
     return recognizer->Feed(samples, count, last != 0);
   });

@@ -1,7 +1,7 @@
 #include "recognizer.h"
 
-#include <pocketsphinx.h>
 #include <err.h>
+#include <pocketsphinx.h>
 
 #include <algorithm>
 #include <mutex>
@@ -32,9 +32,7 @@ std::mutex log_setup_mutex;
 // Filler words (sentence marks, silence, noises) are written <...>, [...] or
 // ++...++ in the dictionaries PocketSphinx reads; they are not recognised
 // words and carry no confidence worth averaging.
-bool IsFillerWord(const char* word) {
-  return word[0] == '<' || word[0] == '[' || word[0] == '+';
-}
+bool IsFillerWord(const char* word) { return word[0] == '<' || word[0] == '[' || word[0] == '+'; }
 
 bool IsKnownOption(const std::string& name) {
   const std::string flag = "-" + name;
@@ -60,9 +58,8 @@ class CallbackScope {
 
 std::unique_ptr<Recognizer> Recognizer::Create(const ModelSettings& settings) {
   // Parsed as a command line, whose first word names the program.
-  std::vector<std::string> args = {"kvasr_decoder",
-                                   "-hmm", settings.acoustic_model_dir,
-                                   "-dict", settings.dictionary};
+  std::vector<std::string> args = {"kvasr_decoder", "-hmm", settings.acoustic_model_dir, "-dict",
+                                   settings.dictionary};
   if (!settings.filler_dictionary.empty()) {
     args.insert(args.end(), {"-fdict", settings.filler_dictionary});
   }
@@ -83,8 +80,8 @@ std::unique_ptr<Recognizer> Recognizer::Create(const ModelSettings& settings) {
 
   std::lock_guard<std::mutex> lock(log_setup_mutex);
   err_set_logfp(settings.log_to_stderr ? stderr : nullptr);
-  cmd_ln_t* config = cmd_ln_parse_r(nullptr, ps_args(), static_cast<int32>(argv.size()),
-                                    argv.data(), TRUE);
+  cmd_ln_t* config =
+      cmd_ln_parse_r(nullptr, ps_args(), static_cast<int32>(argv.size()), argv.data(), TRUE);
   if (config == nullptr) {
     ReportError("the recogniser rejected an option value in the model manifest");
     return nullptr;
@@ -93,8 +90,9 @@ std::unique_ptr<Recognizer> Recognizer::Create(const ModelSettings& settings) {
   // The decoder keeps its own reference to the configuration.
   cmd_ln_free_r(config);
   if (ps == nullptr) {
-    ReportError("the recogniser could not load the model named in the manifest "
-                "(\"log = stderr\" in the manifest shows why)");
+    ReportError(
+        "the recogniser could not load the model named in the manifest "
+        "(\"log = stderr\" in the manifest shows why)");
     return nullptr;
   }
   cmd_ln_t* used = ps_get_config(ps);
@@ -110,8 +108,7 @@ std::unique_ptr<Recognizer> Recognizer::Create(const ModelSettings& settings) {
       new Recognizer(ps, frame_shift_samples, hangover_frames * frame_shift_samples));
 }
 
-Recognizer::Recognizer(ps_decoder_t* ps, int64_t frame_shift_samples,
-                       int64_t hangover_samples)
+Recognizer::Recognizer(ps_decoder_t* ps, int64_t frame_shift_samples, int64_t hangover_samples)
     : ps_(ps), frame_shift_samples_(frame_shift_samples), detector_(hangover_samples) {
   SetSpeechEndLimits(kDefaultLeadingSilenceMs, kDefaultTrailingSilenceMs);
 }

@@ -27,11 +27,8 @@ int SpeechEndDetector::Update(bool in_speech, int64_t count) {
       phase_ = Phase::kTrailingSilence;
       silence_samples_ = hangover_samples_;
       break;
-    case Phase::kTrailingSilence:
-      silence_samples_ += count;
-      break;
-    case Phase::kEnded:
-      return 0;
+    case Phase::kTrailingSilence: silence_samples_ += count; break;
+    case Phase::kEnded: return 0;
   }
   if (silence_samples_ >= trailing_limit_samples_) {
     phase_ = Phase::kEnded;

@@ -12,8 +12,7 @@ class SpeechEndDetector {
   // `hangover_samples`: how much silence the front end needs before it
   // reports that speech stopped. Trailing limits shorter than that act as
   // the hangover itself.
-  explicit SpeechEndDetector(int64_t hangover_samples)
-      : hangover_samples_(hangover_samples) {}
+  explicit SpeechEndDetector(int64_t hangover_samples) : hangover_samples_(hangover_samples) {}
 
   // `leading_samples` (0: none): silence from the utterance start after
   // which the utterance counts as empty. `trailing_samples`: silence after

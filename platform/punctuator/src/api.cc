@@ -20,8 +20,9 @@ KVASR_PUNCT_EXPORT void* punctuator_init(const char* model_path, const char* voc
                                          const char* bpe_path, const char* lang) {
   using kvasr::punct::ModelFiles;
   using kvasr::punct::Punctuator;
-  const ModelFiles files{OrEmpty(model_path), OrEmpty(vocab_path), OrEmpty(punc_path), OrEmpty(num_path),
-                         OrEmpty(case_path),  OrEmpty(xdb_path),   OrEmpty(bpe_path)};
+  const ModelFiles files{OrEmpty(model_path), OrEmpty(vocab_path), OrEmpty(punc_path),
+                         OrEmpty(num_path),   OrEmpty(case_path),  OrEmpty(xdb_path),
+                         OrEmpty(bpe_path)};
   std::string error;
   std::unique_ptr<Punctuator> p;
   // Nothing may leave a C function; running out of memory is one more

@@ -1,11 +1,12 @@
 #include "network.h"
 
 #include <algorithm>
-#include <atomic>
 #include <cmath>
 #include <cstring>
 #include <fstream>
 #include <iterator>
+
+#include "cpu_dispatch.h"
 
 namespace kvasr {
 namespace punct {
@@ -58,7 +59,8 @@ class HalfReader {
 
   std::vector<float> Take(size_t count) {
     std::vector<float> v(count);
-    for (size_t i = 0; i < count; ++i, p_ += 2) v[i] = HalfToFloat(static_cast<uint16_t>(p_[0] | p_[1] << 8));
+    for (size_t i = 0; i < count; ++i, p_ += 2)
+      v[i] = HalfToFloat(static_cast<uint16_t>(p_[0] | p_[1] << 8));
     return v;
   }
 
@@ -87,9 +89,10 @@ constexpr size_t kStateOutBlockBaseline = 32;
 // bias are padded with zeros to `stride`, a multiple of kOut, so every tile
 // is whole.
 template <typename V, int kRows, size_t kOut>
-__attribute__((always_inline)) inline void ProductTiles(const float* const* in, int parts, size_t cin,
-                                                        const float* w, size_t stride, const float* bias,
-                                                        size_t cout, float* const* out) {
+__attribute__((always_inline)) inline void ProductTiles(const float* const* in, int parts,
+                                                        size_t cin, const float* w, size_t stride,
+                                                        const float* bias, size_t cout,
+                                                        float* const* out) {
   constexpr size_t kLanes = sizeof(V) / sizeof(float);
   constexpr size_t kVectors = kOut / kLanes;
   for (size_t o0 = 0; o0 < cout; o0 += kOut) {
@@ -99,7 +102,8 @@ __attribute__((always_inline)) inline void ProductTiles(const float* const* in, 
 #pragma GCC unroll 8
     for (int r = 0; r < kRows; ++r)
 #pragma GCC unroll 8
-      for (size_t v = 0; v < kVectors; ++v) std::memcpy(&acc[r][v], bias + o0 + v * kLanes, sizeof(V));
+      for (size_t v = 0; v < kVectors; ++v)
+        std::memcpy(&acc[r][v], bias + o0 + v * kLanes, sizeof(V));
     for (int p = 0; p < parts; ++p) {
       const float* wp = w + static_cast<size_t>(p) * cin * stride + o0;
       for (size_t i = 0; i < cin; ++i) {
@@ -117,50 +121,46 @@ __attribute__((always_inline)) inline void ProductTiles(const float* const* in, 
       }
     }
     const size_t width = std::min(kOut, cout - o0);
-    for (int r = 0; r < kRows; ++r) std::copy_n(reinterpret_cast<const float*>(acc[r]), width, out[r] + o0);
+    for (int r = 0; r < kRows; ++r)
+      std::copy_n(reinterpret_cast<const float*>(acc[r]), width, out[r] + o0);
   }
 }
 
-// Set by UseBaselineProducts.
-std::atomic<bool> g_baseline_only{false};
-
-// The processor's answer is taken once, at first use: resolvers run by the
-// loader (ifunc) come before sanitizer runtimes are ready, and "arch="
-// clones dispatch on the CPU model rather than its features.
-bool UseAvx2() {
-  static const bool has = __builtin_cpu_supports("avx2") && __builtin_cpu_supports("fma");
-  return has && !g_baseline_only.load(std::memory_order_relaxed);
-}
-
-__attribute__((target("avx2,fma"))) void RowsProductAvx2(const float* const* in, int parts, size_t cin,
-                                                         const float* w, size_t stride, const float* bias,
-                                                         size_t cout, float* const* out) {
+__attribute__((target("avx2,fma"))) void RowsProductAvx2(const float* const* in, int parts,
+                                                         size_t cin, const float* w, size_t stride,
+                                                         const float* bias, size_t cout,
+                                                         float* const* out) {
   ProductTiles<Lanes8, kTimeBlock, kRowsOutBlock>(in, parts, cin, w, stride, bias, cout, out);
 }
 
-__attribute__((target("avx2,fma"))) void StateProductAvx2(const float* in, size_t cin, const float* w,
-                                                          size_t stride, const float* bias, size_t cout,
+__attribute__((target("avx2,fma"))) void StateProductAvx2(const float* in, size_t cin,
+                                                          const float* w, size_t stride,
+                                                          const float* bias, size_t cout,
                                                           float* out) {
   ProductTiles<Lanes8, 1, kStateOutBlock>(&in, 1, cin, w, stride, bias, cout, &out);
 }
 
 void RowsProduct(const float* const* in, int parts, size_t cin, const float* w, size_t stride,
                  const float* bias, size_t cout, float* const* out) {
-  if (UseAvx2()) return RowsProductAvx2(in, parts, cin, w, stride, bias, cout, out);
-  ProductTiles<Lanes4, kTimeBlock, kRowsOutBlockBaseline>(in, parts, cin, w, stride, bias, cout, out);
+  if (kvasr_common::HasAvx2Fma()) {
+    return RowsProductAvx2(in, parts, cin, w, stride, bias, cout, out);
+  }
+  ProductTiles<Lanes4, kTimeBlock, kRowsOutBlockBaseline>(in, parts, cin, w, stride, bias, cout,
+                                                          out);
 }
 
 // The product of the recurrent state (one row) with a gate matrix.
-void StateProduct(const float* in, size_t cin, const float* w, size_t stride, const float* bias, size_t cout,
-                  float* out) {
-  if (UseAvx2()) return StateProductAvx2(in, cin, w, stride, bias, cout, out);
+void StateProduct(const float* in, size_t cin, const float* w, size_t stride, const float* bias,
+                  size_t cout, float* out) {
+  if (kvasr_common::HasAvx2Fma()) return StateProductAvx2(in, cin, w, stride, bias, cout, out);
   ProductTiles<Lanes4, 1, kStateOutBlockBaseline>(&in, 1, cin, w, stride, bias, cout, &out);
 }
 
 size_t RoundUp(size_t n, size_t block) { return (n + block - 1) / block * block; }
 
 // [rows][cols] to [cols][stride], the columns past `rows` zero.
-std::vector<float> TransposePadded(const std::vector<float>& m, size_t rows, size_t cols, size_t stride) {
+std::vector<float> TransposePadded(const std::vector<float>& m, size_t rows, size_t cols,
+                                   size_t stride) {
   std::vector<float> t(cols * stride, 0.0f);
   for (size_t r = 0; r < rows; ++r)
     for (size_t c = 0; c < cols; ++c) t[c * stride + r] = m[r * cols + c];
@@ -175,8 +175,6 @@ std::vector<float> Padded(std::vector<float> v, size_t size) {
 float Sigmoid(float x) { return 1.0f / (1.0f + std::exp(-x)); }
 
 }  // namespace
-
-void UseBaselineProducts(bool on) { g_baseline_only.store(on, std::memory_order_relaxed); }
 
 bool Network::Load(const std::string& path, std::string* error) {
   std::ifstream in(path, std::ios::binary);
@@ -211,14 +209,14 @@ bool Network::Load(const std::string& path, std::string* error) {
   s.kernel = f[5], s.hidden = f[6], s.punct_classes = f[7], s.case_classes = f[8];
   s.max_word_bytes = f[9], s.max_pieces = f[10], s.window_step = f[11], s.window_context = f[12];
 
-  const bool sane = s.vocab >= 1 && s.vocab <= kMaxVocab && s.pieces <= kMaxVocab && s.dim >= 1 &&
-                    s.dim <= kMaxWidth && s.convs <= kMaxLayers && s.channels <= kMaxWidth &&
-                    (s.convs == 0 || (s.channels >= 1 && s.kernel % 2 == 1 && s.kernel <= kMaxKernel)) &&
-                    s.hidden <= kMaxWidth && s.punct_classes >= 1 && s.punct_classes <= kMaxWidth &&
-                    s.case_classes >= 1 && s.case_classes <= kMaxWidth && s.max_word_bytes >= 1 &&
-                    s.max_word_bytes <= kMaxWordBytes && s.max_pieces >= 1 &&
-                    s.max_pieces <= kMaxWordBytes && s.window_step >= 1 &&
-                    s.window_step + 2 * s.window_context <= kMaxWindow;
+  const bool sane =
+      s.vocab >= 1 && s.vocab <= kMaxVocab && s.pieces <= kMaxVocab && s.dim >= 1 &&
+      s.dim <= kMaxWidth && s.convs <= kMaxLayers && s.channels <= kMaxWidth &&
+      (s.convs == 0 || (s.channels >= 1 && s.kernel % 2 == 1 && s.kernel <= kMaxKernel)) &&
+      s.hidden <= kMaxWidth && s.punct_classes >= 1 && s.punct_classes <= kMaxWidth &&
+      s.case_classes >= 1 && s.case_classes <= kMaxWidth && s.max_word_bytes >= 1 &&
+      s.max_word_bytes <= kMaxWordBytes && s.max_pieces >= 1 && s.max_pieces <= kMaxWordBytes &&
+      s.window_step >= 1 && s.window_step + 2 * s.window_context <= kMaxWindow;
   if (!sane) {
     *error = "model file '" + path + "' has an impossible shape";
     return false;
@@ -289,7 +287,8 @@ void Network::Embed(const WordInput* words, int n) {
   const size_t dim = shape_.dim;
   for (int t = 0; t < n; ++t) {
     float* x = &act_a_[t * dim];
-    const int32_t id = words[t].id >= 0 && static_cast<uint32_t>(words[t].id) < shape_.vocab ? words[t].id : 0;
+    const int32_t id =
+        words[t].id >= 0 && static_cast<uint32_t>(words[t].id) < shape_.vocab ? words[t].id : 0;
     std::copy_n(&word_emb_[id * dim], dim, x);
     // Mean of the subword vectors, summed first as the trainer does.
     float* bag = &act_b_[t * dim];
@@ -322,10 +321,13 @@ void Network::Convolve(int layer, int n) {
       out[j] = &act_b_[static_cast<size_t>(t0 + j) * cout];
       for (int k = 0; k < kernel; ++k) {
         const int src = t0 + j + (k - half) * dilation;
-        in[j * kernel + k] = t0 + j < n && src >= 0 && src < n ? &act_a_[static_cast<size_t>(src) * cin] : zeros_.data();
+        in[j * kernel + k] = t0 + j < n && src >= 0 && src < n
+                                 ? &act_a_[static_cast<size_t>(src) * cin]
+                                 : zeros_.data();
       }
     }
-    RowsProduct(in, kernel, cin, conv_w_[layer].data(), conv_stride_, conv_b_[layer].data(), cout, out);
+    RowsProduct(in, kernel, cin, conv_w_[layer].data(), conv_stride_, conv_b_[layer].data(), cout,
+                out);
   }
   // The first layer changes width; the others add to what they are given.
   for (int t = 0; t < n; ++t) {
@@ -355,7 +357,8 @@ void Network::RunGru(const Gru& g, int n, bool reverse, int out_offset) {
   std::fill(state_.begin(), state_.end(), 0.0f);
   for (int step = 0; step < n; ++step) {
     const int t = reverse ? n - 1 - step : step;
-    StateProduct(state_.data(), hid, g.w_hh.data(), state_gate_stride_, g.b_hh.data(), gates, gates_h_.data());
+    StateProduct(state_.data(), hid, g.w_hh.data(), state_gate_stride_, g.b_hh.data(), gates,
+                 gates_h_.data());
     const float* gx = &gates_x_[t * gates];
     const float* gh = gates_h_.data();
     float* o = &feat_[t * feat + out_offset];
@@ -383,7 +386,8 @@ void Network::Forward(const WordInput* words, int n, float* punct, float* casing
     feat = 2 * shape_.hidden;
     features = feat_.data();
   }
-  const auto head = [&](const std::vector<float>& w, const std::vector<float>& b, size_t classes, float* out) {
+  const auto head = [&](const std::vector<float>& w, const std::vector<float>& b, size_t classes,
+                        float* out) {
     for (int t = 0; t < n; ++t) {
       const float* f = features + t * feat;
       for (size_t c = 0; c < classes; ++c) {

@@ -35,11 +35,6 @@ struct WordInput {
   const int32_t* pieces = nullptr;
 };
 
-// Makes every Network in the process run its products with the baseline
-// (SSE) code even where AVX2 is available, so tests can check the path that
-// older processors take. Off by default.
-void UseBaselineProducts(bool on);
-
 class Network {
  public:
   // False with a reason in `error` when the file is missing, truncated,
@@ -48,7 +43,9 @@ class Network {
 
   const NetworkShape& shape() const { return shape_; }
   // Words one Forward call can take.
-  int max_window() const { return static_cast<int>(shape_.window_step + 2 * shape_.window_context); }
+  int max_window() const {
+    return static_cast<int>(shape_.window_step + 2 * shape_.window_context);
+  }
 
   // Logits for `n` <= max_window() words, row-major: punct [n][punct_classes],
   // casing [n][case_classes]. Uses only buffers sized by Load.

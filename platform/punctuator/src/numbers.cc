@@ -20,10 +20,11 @@ constexpr std::string_view kArticle = "a";
 
 bool ParseKind(const std::string& s, Kind* kind) {
   static const std::pair<const char*, Kind> kNames[] = {
-      {"unit", Kind::kUnit},       {"teen", Kind::kTeen},   {"tens", Kind::kTens},
-      {"hundred", Kind::kHundred}, {"scale", Kind::kScale}, {"ordinal", Kind::kOrdinal},
-      {"decade", Kind::kDecade},   {"point", Kind::kPoint}, {"and", Kind::kAnd},
-      {"oh", Kind::kOh}};
+      {"unit", Kind::kUnit},     {"teen", Kind::kTeen},
+      {"tens", Kind::kTens},     {"hundred", Kind::kHundred},
+      {"scale", Kind::kScale},   {"ordinal", Kind::kOrdinal},
+      {"decade", Kind::kDecade}, {"point", Kind::kPoint},
+      {"and", Kind::kAnd},       {"oh", Kind::kOh}};
   for (const auto& [name, k] : kNames) {
     if (s == name) {
       *kind = k;
@@ -76,7 +77,8 @@ bool OpensTail(Kind k, int64_t value) {
 
 }  // namespace
 
-bool NumberRules::Load(const std::string& num_path, const std::string& xdb_path, std::string* error) {
+bool NumberRules::Load(const std::string& num_path, const std::string& xdb_path,
+                       std::string* error) {
   std::vector<std::string> lines;
   if (!ReadModelText(num_path, "num", &lines, error)) return false;
   struct Row {
@@ -138,7 +140,8 @@ const NumberRules::Word* NumberRules::Lookup(std::string_view w) const {
   return it == words_.end() ? nullptr : &it->second;
 }
 
-int NumberRules::KeepPhraseLength(const std::vector<std::string_view>& words, int at, int limit) const {
+int NumberRules::KeepPhraseLength(const std::vector<std::string_view>& words, int at,
+                                  int limit) const {
   for (const std::vector<std::string>& phrase : keep_phrases_) {
     const int n = static_cast<int>(phrase.size());
     if (at + n - 1 > limit) continue;
@@ -152,12 +155,12 @@ int NumberRules::KeepPhraseLength(const std::vector<std::string_view>& words, in
 // "nineteen ninety five", "twenty twelve", "eighteen oh five", "nineteen
 // sixties": a first pair of digits from eleven to twenty said as one word,
 // then the last two.
-bool NumberRules::ParseYear(const std::vector<std::string_view>& words, int at, int limit, Parsed* p,
-                            std::string* out) const {
+bool NumberRules::ParseYear(const std::vector<std::string_view>& words, int at, int limit,
+                            Parsed* p, std::string* out) const {
   constexpr int64_t kFirstMin = 11, kFirstMax = 20;
   const Word* first = Lookup(words[at]);
-  if (!first || !(first->kind == Kind::kTeen || first->kind == Kind::kTens) || first->value < kFirstMin ||
-      first->value > kFirstMax || at + 1 > limit)
+  if (!first || !(first->kind == Kind::kTeen || first->kind == Kind::kTens) ||
+      first->value < kFirstMin || first->value > kFirstMax || at + 1 > limit)
     return false;
   const Word* second = Lookup(words[at + 1]);
   if (!second) return false;
@@ -190,8 +193,8 @@ bool NumberRules::ParseYear(const std::vector<std::string_view>& words, int at, 
   return true;
 }
 
-NumberRules::Parsed NumberRules::Parse(const std::vector<std::string_view>& words, int at, int limit,
-                                       std::string* out) const {
+NumberRules::Parsed NumberRules::Parse(const std::vector<std::string_view>& words, int at,
+                                       int limit, std::string* out) const {
   Parsed p;
   p.end = at;
   if (ParseYear(words, at, limit, &p, out)) return p;
@@ -211,7 +214,9 @@ NumberRules::Parsed NumberRules::Parse(const std::vector<std::string_view>& word
       ++i;
     }
   }
-  const auto opens_group = [&] { return !have || last == Kind::kHundred || last == Kind::kScale || last == Kind::kAnd; };
+  const auto opens_group = [&] {
+    return !have || last == Kind::kHundred || last == Kind::kScale || last == Kind::kAnd;
+  };
   for (; i <= limit; ++i) {
     const Word* w = Lookup(words[i]);
     if (!w) break;
@@ -228,7 +233,8 @@ NumberRules::Parsed NumberRules::Parse(const std::vector<std::string_view>& word
         if (ok) group += w->value;
         break;
       case Kind::kHundred:
-        ok = have && group > 0 && group < 100 && (last == Kind::kUnit || last == Kind::kTeen || last == Kind::kTens);
+        ok = have && group > 0 && group < 100 &&
+             (last == Kind::kUnit || last == Kind::kTeen || last == Kind::kTens);
         if (ok) group *= 100;
         break;
       case Kind::kScale:
@@ -241,11 +247,11 @@ NumberRules::Parsed NumberRules::Parse(const std::vector<std::string_view>& word
         break;
       case Kind::kAnd: {
         const Word* next = i + 1 <= limit ? Lookup(words[i + 1]) : nullptr;
-        ok = have && (last == Kind::kHundred || last == Kind::kScale) && next && OpensTail(next->kind, next->value);
+        ok = have && (last == Kind::kHundred || last == Kind::kScale) && next &&
+             OpensTail(next->kind, next->value);
         break;
       }
-      default:
-        break;
+      default: break;
     }
     if (!ok || total + group >= kMaxValue) break;
     after_tens = role == Kind::kTens && w->kind != Kind::kOrdinal;
@@ -284,7 +290,8 @@ NumberRules::Parsed NumberRules::Parse(const std::vector<std::string_view>& word
 
   // "3 million", "2.5 billion": a round large number keeps its scale word.
   const Word* after = end <= limit ? Lookup(words[end]) : nullptr;
-  if (!decimals.empty() && after && after->kind == Kind::kScale && after->value >= round_from_ && total == 0) {
+  if (!decimals.empty() && after && after->kind == Kind::kScale && after->value >= round_from_ &&
+      total == 0) {
     AppendDigits(value, false, out);
     out->push_back('.');
     out->append(decimals);
@@ -293,8 +300,8 @@ NumberRules::Parsed NumberRules::Parse(const std::vector<std::string_view>& word
     p.end = end + 1;
     return p;
   }
-  if (!ordinal && decimals.empty() && group == 0 && last == Kind::kScale && last_scale >= round_from_ &&
-      total / last_scale < 1000) {
+  if (!ordinal && decimals.empty() && group == 0 && last == Kind::kScale &&
+      last_scale >= round_from_ && total / last_scale < 1000) {
     AppendDigits(total / last_scale, false, out);
     out->push_back(' ');
     out->append(words[i - 1]);
@@ -311,8 +318,9 @@ NumberRules::Parsed NumberRules::Parse(const std::vector<std::string_view>& word
   return p;
 }
 
-void NumberRules::Apply(const std::vector<std::string_view>& words, const std::vector<bool>& stop_after,
-                        std::vector<Span>* spans, std::string* scratch) const {
+void NumberRules::Apply(const std::vector<std::string_view>& words,
+                        const std::vector<bool>& stop_after, std::vector<Span>* spans,
+                        std::string* scratch) const {
   spans->clear();
   scratch->clear();
   const int n = static_cast<int>(words.size());

@@ -53,7 +53,8 @@ class NumberRules {
 
   const Word* Lookup(std::string_view w) const;
   int KeepPhraseLength(const std::vector<std::string_view>& words, int at, int limit) const;
-  Parsed Parse(const std::vector<std::string_view>& words, int at, int limit, std::string* out) const;
+  Parsed Parse(const std::vector<std::string_view>& words, int at, int limit,
+               std::string* out) const;
   bool ParseYear(const std::vector<std::string_view>& words, int at, int limit, Parsed* p,
                  std::string* out) const;
 

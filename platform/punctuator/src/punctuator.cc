@@ -15,7 +15,9 @@ enum CaseClass { kLower = 0, kCapital = 1, kUpper = 2, kLexiconForm = 3 };
 // Marks a recogniser might leave on a word; the network decides anew.
 constexpr std::string_view kStrippedMarks = ",.?!;:";
 
-bool IsSpace(char c) { return c == ' ' || c == '\t' || c == '\n' || c == '\r' || c == '\f' || c == '\v'; }
+bool IsSpace(char c) {
+  return c == ' ' || c == '\t' || c == '\n' || c == '\r' || c == '\f' || c == '\v';
+}
 char AsciiLower(char c) { return c >= 'A' && c <= 'Z' ? static_cast<char>(c - 'A' + 'a') : c; }
 char AsciiUpper(char c) { return c >= 'a' && c <= 'z' ? static_cast<char>(c - 'a' + 'A') : c; }
 
@@ -43,8 +45,8 @@ bool Punctuator::Load(const ModelFiles& f, const std::string& lang, std::string*
   if (!Require(f.model, "model", error) || !Require(f.vocab, "vocab", error) ||
       !Require(f.punc, "punc", error) || !Require(f.bpe, "bpe", error))
     return false;
-  if (!network_.Load(f.model, error) || !vocab_.Load(f.vocab, error) || !LoadLabels(f.punc, &labels_, error) ||
-      !subwords_.Load(f.bpe, error))
+  if (!network_.Load(f.model, error) || !vocab_.Load(f.vocab, error) ||
+      !LoadLabels(f.punc, &labels_, error) || !subwords_.Load(f.bpe, error))
     return false;
   if (!f.casing.empty() && !case_lexicon_.Load(f.casing, error)) return false;
   have_numbers_ = !f.num.empty();
@@ -52,18 +54,22 @@ bool Punctuator::Load(const ModelFiles& f, const std::string& lang, std::string*
 
   const NetworkShape& s = network_.shape();
   const auto mismatch = [&](const std::string& what, size_t file, size_t model) {
-    *error = what + " has " + std::to_string(file) + " entries, the model expects " + std::to_string(model);
+    *error = what + " has " + std::to_string(file) + " entries, the model expects " +
+             std::to_string(model);
     return false;
   };
   if (s.lang != lang) {
     *error = "model file '" + f.model + "' is for language '" + s.lang + "', not '" + lang + "'";
     return false;
   }
-  if (vocab_.size() != s.vocab) return mismatch("vocab file '" + f.vocab + "'", vocab_.size(), s.vocab);
-  if (labels_.size() != s.punct_classes) return mismatch("punc file '" + f.punc + "'", labels_.size(), s.punct_classes);
+  if (vocab_.size() != s.vocab)
+    return mismatch("vocab file '" + f.vocab + "'", vocab_.size(), s.vocab);
+  if (labels_.size() != s.punct_classes)
+    return mismatch("punc file '" + f.punc + "'", labels_.size(), s.punct_classes);
   if (static_cast<uint32_t>(subwords_.size()) != s.pieces)
     return mismatch("bpe file '" + f.bpe + "'", static_cast<size_t>(subwords_.size()), s.pieces);
-  if (s.case_classes != kCaseClasses) return mismatch("the model's casing head", s.case_classes, kCaseClasses);
+  if (s.case_classes != kCaseClasses)
+    return mismatch("the model's casing head", s.case_classes, kCaseClasses);
   end_label_ = -1;
   for (size_t i = 0; i < labels_.size() && end_label_ < 0; ++i)
     if (labels_[i].kind == MarkKind::kEnd) end_label_ = static_cast<int>(i);
@@ -85,7 +91,8 @@ void Punctuator::Tokenise(const char* text) {
     const size_t start = i;
     while (i < n && !IsSpace(lower_[i])) ++i;
     std::string_view w(lower_.data() + start, i - start);
-    while (!w.empty() && kStrippedMarks.find(w.back()) != std::string_view::npos) w.remove_suffix(1);
+    while (!w.empty() && kStrippedMarks.find(w.back()) != std::string_view::npos)
+      w.remove_suffix(1);
     if (!w.empty()) words_.push_back(w);
   }
 }
@@ -99,7 +106,8 @@ void Punctuator::RunNetwork(Visit visit) {
   for (int t = 0; t < n; ++t) {
     int32_t* pieces = &pieces_[static_cast<size_t>(t) * s.max_word_bytes];
     const int count = subwords_.Encode(words_[t], pieces, static_cast<int>(s.max_word_bytes));
-    inputs_[t] = WordInput{vocab_.Find(words_[t]), std::min(count, static_cast<int>(s.max_pieces)), pieces};
+    inputs_[t] =
+        WordInput{vocab_.Find(words_[t]), std::min(count, static_cast<int>(s.max_pieces)), pieces};
   }
   const int step = static_cast<int>(s.window_step);
   const int context = static_cast<int>(s.window_context);
@@ -148,19 +156,18 @@ void Punctuator::AppendWord(int i, bool sentence_start) {
   } else {
     output_.append(w);
     switch (casing_[i]) {
-      case kCapital:
-        output_[at] = AsciiUpper(output_[at]);
-        break;
+      case kCapital: output_[at] = AsciiUpper(output_[at]); break;
       case kUpper:
         std::transform(output_.begin() + static_cast<ptrdiff_t>(at), output_.end(),
                        output_.begin() + static_cast<ptrdiff_t>(at), AsciiUpper);
         break;
       case kLexiconForm:
-        if (entry) output_.replace(at, w.size(), entry->form);
-        else output_[at] = AsciiUpper(output_[at]);
+        if (entry)
+          output_.replace(at, w.size(), entry->form);
+        else
+          output_[at] = AsciiUpper(output_[at]);
         break;
-      default:
-        break;
+      default: break;
     }
   }
   if (sentence_start) output_[at] = AsciiUpper(output_[at]);
@@ -168,7 +175,8 @@ void Punctuator::AppendWord(int i, bool sentence_start) {
 
 void Punctuator::Compose() {
   stop_after_.resize(words_.size());
-  for (size_t i = 0; i < words_.size(); ++i) stop_after_[i] = labels_[label_[i]].kind != MarkKind::kNone;
+  for (size_t i = 0; i < words_.size(); ++i)
+    stop_after_[i] = labels_[label_[i]].kind != MarkKind::kNone;
   if (have_numbers_) {
     numbers_.Apply(words_, stop_after_, &spans_, &number_text_);
   } else {
@@ -180,8 +188,10 @@ void Punctuator::Compose() {
   bool sentence_start = true;
   for (const Span& span : spans_) {
     if (!output_.empty()) output_.push_back(' ');
-    if (span.number) output_.append(number_text_, span.text_offset, span.text_size);
-    else AppendWord(span.first, sentence_start);
+    if (span.number)
+      output_.append(number_text_, span.text_offset, span.text_size);
+    else
+      AppendWord(span.first, sentence_start);
     const Label& label = labels_[label_[span.last]];
     output_.append(label.mark);
     sentence_start = label.kind == MarkKind::kEnd;

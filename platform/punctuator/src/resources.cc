@@ -29,8 +29,8 @@ std::vector<std::string> SplitTabs(const std::string& line, size_t fields) {
 
 }  // namespace
 
-bool ReadModelText(const std::string& path, const std::string& kind, std::vector<std::string>* lines,
-                   std::string* error) {
+bool ReadModelText(const std::string& path, const std::string& kind,
+                   std::vector<std::string>* lines, std::string* error) {
   std::ifstream in(path);
   if (!in) {
     *error = "cannot open " + kind + " file '" + path + "'";
@@ -39,7 +39,8 @@ bool ReadModelText(const std::string& path, const std::string& kind, std::vector
   std::string line;
   const std::string prefix = kHeaderPrefix + kind + " ";
   if (!std::getline(in, line) || line.compare(0, prefix.size(), prefix) != 0) {
-    *error = "'" + path + "' is not a " + kind + " file (first line must start with '" + prefix + "')";
+    *error =
+        "'" + path + "' is not a " + kind + " file (first line must start with '" + prefix + "')";
     return false;
   }
   if (line.substr(prefix.size()) != std::to_string(kTextFormatVersion)) {
@@ -82,10 +83,14 @@ bool LoadLabels(const std::string& path, std::vector<Label>* labels, std::string
     if (f.size() == 3) {
       label.name = f[0];
       label.mark = f[1];
-      if (f[2] == "none") label.kind = MarkKind::kNone;
-      else if (f[2] == "pause") label.kind = MarkKind::kPause;
-      else if (f[2] == "end") label.kind = MarkKind::kEnd;
-      else f[2].clear();
+      if (f[2] == "none")
+        label.kind = MarkKind::kNone;
+      else if (f[2] == "pause")
+        label.kind = MarkKind::kPause;
+      else if (f[2] == "end")
+        label.kind = MarkKind::kEnd;
+      else
+        f[2].clear();
     }
     if (f.size() != 3 || label.name.empty() || f[2].empty()) {
       *error = "punc file '" + path + "': bad line '" + line + "'";
@@ -104,13 +109,16 @@ bool Subwords::Load(const std::string& path, std::string* error) {
   std::vector<std::string> lines;
   if (!ReadModelText(path, "bpe", &lines, error)) return false;
   std::unordered_map<std::string, int32_t> symbols;
-  for (int32_t b = 0; b < kByteSymbols; ++b) symbols.emplace(std::string(1, static_cast<char>(b)), b);
+  for (int32_t b = 0; b < kByteSymbols; ++b)
+    symbols.emplace(std::string(1, static_cast<char>(b)), b);
   merges_.clear();
   merge_count_ = 0;
   for (const std::string& line : lines) {
     const size_t space = line.find(' ');
-    const auto left = space == std::string::npos ? symbols.end() : symbols.find(line.substr(0, space));
-    const auto right = space == std::string::npos ? symbols.end() : symbols.find(line.substr(space + 1));
+    const auto left =
+        space == std::string::npos ? symbols.end() : symbols.find(line.substr(0, space));
+    const auto right =
+        space == std::string::npos ? symbols.end() : symbols.find(line.substr(space + 1));
     if (left == symbols.end() || right == symbols.end()) {
       *error = "bpe file '" + path + "': merge '" + line + "' uses an unknown piece";
       return false;
@@ -124,7 +132,8 @@ bool Subwords::Load(const std::string& path, std::string* error) {
 
 int Subwords::Encode(std::string_view word, int32_t* out, int capacity) const {
   int n = 0;
-  for (size_t i = 0; i < word.size() && n < capacity; ++i) out[n++] = static_cast<unsigned char>(word[i]);
+  for (size_t i = 0; i < word.size() && n < capacity; ++i)
+    out[n++] = static_cast<unsigned char>(word[i]);
   for (;;) {
     int best_at = -1;
     const Merge* best = nullptr;
@@ -149,7 +158,8 @@ bool CaseLexicon::Load(const std::string& path, std::string* error) {
   entries_.clear();
   for (const std::string& line : lines) {
     std::vector<std::string> f = SplitTabs(line, 3);
-    if (f.size() != 3 || f[0].empty() || f[1].size() != f[0].size() || (f[2] != "always" && f[2] != "model")) {
+    if (f.size() != 3 || f[0].empty() || f[1].size() != f[0].size() ||
+        (f[2] != "always" && f[2] != "model")) {
       *error = "case file '" + path + "': bad line '" + line + "'";
       return false;
     }

@@ -14,8 +14,8 @@ namespace punct {
 
 // Lines of a model text file after its header "#kvasr-punct-<kind> <version>",
 // without comment lines (starting with '#') and empty lines.
-bool ReadModelText(const std::string& path, const std::string& kind, std::vector<std::string>* lines,
-                   std::string* error);
+bool ReadModelText(const std::string& path, const std::string& kind,
+                   std::vector<std::string>* lines, std::string* error);
 
 // The maps below point into the classes' own strings: no copies.
 class Vocabulary {
