@@ -124,6 +124,20 @@ expect "a missing VAD model folder" 2 - "^kvasr: VAD model folder '/nonexistent'
 expect "missing punctuation settings" 2 - "^kvasr: punctuation settings '/nonexistent.json' cannot be read" -- \
   "$kvasr" transcribe "${common[@]}" --punct-settings /nonexistent.json "$clip"
 
+# The shipped command grammar, beside the default manifest: once through
+# --grammar, once through its own manifest.
+models=$(dirname "$manifest")
+expect "a command grammar through --grammar" 0 "^go forward ten meters$" - -- \
+  sh -c "\"$kvasr\" transcribe --model \"$manifest\" --grammar $models/commands.gram - < $data/goforward.raw"
+expect "a command grammar through its manifest" 0 "^go forward ten meters$" - -- \
+  sh -c "\"$kvasr\" transcribe --model $models/commands.manifest - < $data/goforward.raw"
+printf '#JSGF V1.0;\ngrammar g;\npublic <c> = go forward\n  | go zorblax;\n' >"$work/unknown.gram"
+expect "a grammar word missing from the dictionary" 2 - \
+  "^kvasr_decoder: grammar \"$work/unknown.gram\" line 4: word \"zorblax\" is not in the dictionary" -- \
+  "$kvasr" transcribe "${common[@]}" --grammar "$work/unknown.gram" "$clip"
+expect "a missing grammar" 2 - "^kvasr: grammar '/nonexistent.gram' not found" -- \
+  "$kvasr" transcribe "${common[@]}" --grammar /nonexistent.gram "$clip"
+
 expect "bad chunk size" 2 - "chunk-ms" -- "$kvasr" transcribe "${common[@]}" --chunk-ms 0 "$clip"
 expect "no input" 2 - "no input given" -- "$kvasr" transcribe "${common[@]}"
 expect "unknown command" 2 - "usage" -- "$kvasr" frobnicate
