@@ -10,7 +10,7 @@ packages=(
   libcpprest-dev
   libsndfile1-dev libsamplerate0-dev
   libpocketsphinx-dev pocketsphinx-en-us pocketsphinx-testdata
-  python3 python3-numpy python3-soundfile python3-torch gnuplot-nox
+  python3 python3-numpy python3-soundfile python3-torch python3-pytest gnuplot-nox
   # torch's products go through the system BLAS; the reference one that
   # comes with it trains the punctuation network thirteen times slower.
   libopenblas0-openmp
