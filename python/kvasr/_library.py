@@ -85,7 +85,7 @@ def library():
 def _loaded_path(lib, name):
     """The file the loader chose, read back from the process's mappings."""
     if os.sep in name:
-        return os.path.realpath(name)
+        return os.path.abspath(name)
     symbol = ctypes.cast(lib.vorta_speech_create_offline_asr_engine, ctypes.c_void_p).value
     try:
         with open("/proc/self/maps") as maps:
