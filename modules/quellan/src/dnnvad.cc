@@ -3,19 +3,9 @@
 #include <algorithm>
 #include <cmath>
 #include <cstring>
-#include <new>
-#include <stdexcept>
 
+#include "alloc_zeroed.h"
 #include "quellan_log.h"
-
-namespace {
-
-template <typename T>
-std::unique_ptr<T[]> alloc_zeroed(size_t count) {
-  return std::unique_ptr<T[]>(new (std::nothrow) T[count]());
-}
-
-}  // namespace
 
 Cdnnvad::Cdnnvad(const VadDnnConf& conf)
     : m_max_frames(conf.max_frames),
@@ -34,54 +24,37 @@ Cdnnvad::Cdnnvad(const VadDnnConf& conf)
       m_shift(conf.shift) {
   if (m_max_frames < 1 || m_shift < 1 || m_win_size < 1 || m_skip < 0 || m_feat_dim < 1 ||
       m_head_margin < 0 || m_min_silence < 1 || m_start_offset < 0 || m_end_offset < 0) {
-    QUELLAN_WARN("Invalid detector settings.\n");
-    throw std::runtime_error("init vad failed");
+    QUELLAN_INIT_FAIL("Invalid detector settings.\n");
   }
   const size_t frames = static_cast<size_t>(m_max_frames);
   if (m_energy_gate == 1) {
     m_wav = alloc_zeroed<int16_t>(frames * m_shift);
-    if (!m_wav) {
-      QUELLAN_WARN("Failed to alloc memory for m_wav.\n");
-      throw std::runtime_error("init vad failed");
-    }
+    if (!m_wav) QUELLAN_INIT_FAIL("Failed to alloc memory for m_wav.\n");
     m_client_vad_flag = alloc_zeroed<uint8_t>(frames);
-    if (!m_client_vad_flag) {
-      QUELLAN_WARN("Failed to alloc memory for m_client_vad_flag\n");
-      throw std::runtime_error("init vad failed");
-    }
+    if (!m_client_vad_flag) QUELLAN_INIT_FAIL("Failed to alloc memory for m_client_vad_flag\n");
   }
   m_dnn.reset(load_vaddnn_file(conf.dnn_file));
-  if (!m_dnn) {
-    QUELLAN_WARN("Failed to load vad dnn file[%s].\n", conf.dnn_file);
-    throw std::runtime_error("init vad failed");
-  }
+  if (!m_dnn) QUELLAN_INIT_FAIL("Failed to load vad dnn file[%s].\n", conf.dnn_file);
   if (set_vaddnn_params(m_dnn.get(), m_max_frames, m_start_offset, m_end_offset) != 0) {
-    QUELLAN_WARN("Failed to set_dnn_params\n");
-    throw std::runtime_error("init vad failed");
+    QUELLAN_INIT_FAIL("Failed to set_dnn_params\n");
   }
   if (load_vaddnn_state_weights(m_dnn.get(), conf.state_weights_file) < 0) {
-    QUELLAN_WARN("Failed to load state-weights file[%s].\n", conf.state_weights_file);
-    throw std::runtime_error("init vad failed");
+    QUELLAN_INIT_FAIL("Failed to load state-weights file[%s].\n", conf.state_weights_file);
   }
   if (!(m_skip_score = alloc_zeroed<float>(frames))) {
-    QUELLAN_WARN("Failed to alloc m_skip_score.\n");
-    throw std::runtime_error("init vad failed");
+    QUELLAN_INIT_FAIL("Failed to alloc m_skip_score.\n");
   }
   if (!(m_out_score = alloc_zeroed<float>(frames))) {
-    QUELLAN_WARN("Failed to alloc m_out_score.\n");
-    throw std::runtime_error("init vad failed");
+    QUELLAN_INIT_FAIL("Failed to alloc m_out_score.\n");
   }
   if (!(m_vad_flag = alloc_zeroed<uint8_t>(frames))) {
-    QUELLAN_WARN("Failed to alloc m_vad_flag.\n");
-    throw std::runtime_error("init vad failed");
+    QUELLAN_INIT_FAIL("Failed to alloc m_vad_flag.\n");
   }
   if (!(m_interval_beg = alloc_zeroed<int>(frames))) {
-    QUELLAN_WARN("Failed to alloc m_interval_beg.\n");
-    throw std::runtime_error("init vad failed");
+    QUELLAN_INIT_FAIL("Failed to alloc m_interval_beg.\n");
   }
   if (!(m_interval_end = alloc_zeroed<int>(frames))) {
-    QUELLAN_WARN("Failed to alloc m_interval_end.\n");
-    throw std::runtime_error("init vad failed");
+    QUELLAN_INIT_FAIL("Failed to alloc m_interval_end.\n");
   }
 }
 

@@ -7,7 +7,7 @@
 #include <cstdlib>
 #include <cstring>
 
-#include "cpu_features.h"
+#include "cpu_dispatch.h"
 #include "quellan_log.h"
 
 namespace {
@@ -99,8 +99,10 @@ void layer_product_baseline(const float* in, int rows, int in_dim, const float* 
 
 void layer_product(const float* in, int rows, int in_dim, const float* weights, int out_dim,
                    float alpha, float beta, float* out) {
-  (cpu_has_avx() ? layer_product_avx : layer_product_baseline)(in, rows, in_dim, weights, out_dim,
-                                                               alpha, beta, out);
+  if (kvasr_common::HasAvx()) {
+    return layer_product_avx(in, rows, in_dim, weights, out_dim, alpha, beta, out);
+  }
+  layer_product_baseline(in, rows, in_dim, weights, out_dim, alpha, beta, out);
 }
 
 void fill_bias(const VadDnnLayer& layer, int rows) {
