@@ -11,6 +11,8 @@ packages=(
   libsndfile1-dev libsamplerate0-dev
   libpocketsphinx-dev pocketsphinx-en-us pocketsphinx-testdata
   python3 python3-numpy python3-soundfile python3-torch gnuplot-nox
+  # The Python module's tests, its pip install among them.
+  python3-pytest python3-pip python3-setuptools python3-wheel
   # torch's products go through the system BLAS; the reference one that
   # comes with it trains the punctuation network thirteen times slower.
   libopenblas0-openmp
