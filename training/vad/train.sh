@@ -9,6 +9,7 @@
 # Set KVASR to use an existing kvasr binary; otherwise one is built in
 # build-vadtrain/. Set HIDDEN (e.g. "32 64,32") to compare sizes; the first
 # is shipped. About 17 minutes on one core with OpenBLAS, plus the build.
+# Needs python3-numpy and python3-soundfile: scripts/setup-deps.sh train.
 set -euo pipefail
 here=$(cd "$(dirname "$0")" && pwd)
 repo=$(cd "$here/../.." && pwd)
