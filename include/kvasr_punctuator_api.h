@@ -29,6 +29,7 @@ void* punctuator_init(const char* model_path, const char* vocab_path, const char
 int punctuator_do_it(void* handle, const char* text, char* out, int32_t* size);
 
 /* Frees the handle. Null: no-op. */
+/* compat: the established spelling of an exported name; renaming it breaks every host. */
 void punctuator_relese(void* handle);
 
 #ifdef __cplusplus

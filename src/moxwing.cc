@@ -22,8 +22,8 @@ constexpr std::chrono::milliseconds::rep kMinMaxDurationMs = 1000;
 constexpr int32_t kVadThresholdFirst = 5000;
 constexpr int32_t kVadThresholdSecond = 1000;
 
-// Shared by every instance in the process. Atomic only so that engines on
-// different threads may read it while a host reconfigures it.
+// compat: one limit for every engine in the process; a per-engine one ignores hosts' global init.
+// Atomic only so that engines on different threads may read it while a host reconfigures it.
 std::atomic<std::chrono::milliseconds::rep> g_max_duration_ms{kDefaultMaxDurationMs};
 
 int LanguageFlag(const std::string& lang) {
@@ -83,7 +83,7 @@ bool Moxwing::SetData(const uint16_t* data, int count, bool last) {
   if (!handle_) return false;
   const uint64_t limit_samples =
       static_cast<uint64_t>(g_max_duration_ms.load(std::memory_order_relaxed)) * kSamplesPerMs;
-  // Sign-extended on purpose: the comparison is the decoder's own, unsigned.
+  // compat: sign-extended, as the decoder's own unsigned check; zero-extending restarts elsewhere.
   const uint64_t count_u64 = static_cast<uint64_t>(static_cast<int64_t>(count));
   if (fed_samples_ + count_u64 > limit_samples) Restart();
 

@@ -36,8 +36,8 @@ bool BoolOrFalse(const value& object, const char* key) {
   return v.is_boolean() && v.as_bool();
 }
 
-// A silence limit in samples: milliseconds x 16 in wrapping 32-bit arithmetic,
-// with an absent limit taken as all ones before the multiplication.
+// A silence limit in samples.
+// compat: ms x 16 wraps in 32 bits, absent = all ones first; exact sums move hosts' time-outs.
 uint32_t MuteLimitSamples(const value& asr, const char* key) {
   uint32_t ms = kNoLimit;
   if (asr.has_field(U(key)) && asr.at(U(key)).is_number()) {
@@ -122,6 +122,7 @@ bool OfflineAsrEngineImpl::Init(std::string params) {
     const std::string lang = StringOrEmpty(root, "lang");
     const bool vad_enabled = BoolOrFalse(root, "vad_enabled");
     if (lang.empty()) {
+      // compat: the established wording of this message; hosts match the text.
       std::cout << log_prefix_ << "language can not empty" << std::endl;
       return false;
     }
@@ -133,6 +134,7 @@ bool OfflineAsrEngineImpl::Init(std::string params) {
       // audio of an engine initialised without one.
       vad_ = nullptr;
     }
+    // compat: a refused decoder and the VAD made before it stay until the next Init drops them.
     InitLocalAsr(root, lang);
     state_ = kInitialized;
     lang_ = lang;
@@ -272,7 +274,7 @@ void OfflineAsrEngineImpl::OnDecoderResult(std::error_code status, std::string t
     if (!punctuated.empty()) {
       text = std::move(punctuated);
     } else {
-      // Also logged for every partial text when partial texts are left alone.
+      // compat: also logged for every partial text left alone; hosts' logs always had these lines.
       std::cout << log_prefix_ << "punc failed: " << text << std::endl;
     }
   }

@@ -95,8 +95,8 @@ void Vad::ProcessIn(const uint16_t* data, size_t len, bool end) {
       (out_len > 0 && static_cast<size_t>(out_len) <= capacity) ? static_cast<size_t>(out_len) : 0;
   seg.resize(old + emitted);
 
-  // The order of these tests decides when a segment closes: one that opens
-  // and ends within a call stays open until the next call that ends it.
+  // The order of these tests decides when a segment closes.
+  // compat: a segment that opens and ends in one call stays open until a later call ends it.
   if (m_in_speech) {
     if (ended == 0 && !end) return;
     OpenSegment();

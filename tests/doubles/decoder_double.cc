@@ -5,6 +5,7 @@
 #include <map>
 #include <memory>
 
+#include "double_state.h"
 #include "kvasr_decoder_api.h"
 
 namespace decoder_double {
@@ -16,8 +17,8 @@ struct Decoder {
   mw_speech_end_callback on_speech_end = nullptr;
 };
 
-struct World {
-  std::vector<Call> calls;
+// Decoders are their own handles, so the inherited handle set stays empty.
+struct World : doubles::DoubleState<Call> {
   std::map<void*, std::unique_ptr<Decoder>> decoders;
   bool init_fails = false;
   int start_result = 0;
@@ -26,10 +27,7 @@ struct World {
   std::deque<std::vector<Event>> on_stop;
 };
 
-World& world() {
-  static World w;
-  return w;
-}
+World& world() { return doubles::Instance<World>(); }
 
 Decoder* Find(void* handle) {
   auto it = world().decoders.find(handle);
@@ -74,10 +72,7 @@ std::vector<std::string> CallNames() {
   return names;
 }
 
-int Count(const std::string& name) {
-  const std::vector<std::string> names = CallNames();
-  return static_cast<int>(std::count(names.begin(), names.end(), name));
-}
+int Count(const std::string& name) { return world().Count(name); }
 
 int LiveDecoders() { return static_cast<int>(world().decoders.size()); }
 void SetInitFails(bool fails) { world().init_fails = fails; }

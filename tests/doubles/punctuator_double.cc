@@ -3,35 +3,26 @@
 #include <algorithm>
 #include <cstring>
 #include <deque>
-#include <set>
 
+#include "double_state.h"
 #include "kvasr_punctuator_api.h"
 
 namespace punctuator_double {
 namespace {
 
-struct World {
-  std::vector<Call> calls;
-  std::set<void*> handles;
+struct World : doubles::DoubleState<Call> {
   bool init_fails = false;
   std::deque<Reply> replies;
-  uintptr_t next_handle = 1;
 };
 
-World& world() {
-  static World w;
-  return w;
-}
+World& world() { return doubles::Instance<World>(); }
 
 }  // namespace
 
 void Reset() { world() = World(); }
 const std::vector<Call>& Calls() { return world().calls; }
 
-int Count(const std::string& name) {
-  return static_cast<int>(std::count_if(world().calls.begin(), world().calls.end(),
-                                        [&](const Call& c) { return c.name == name; }));
-}
+int Count(const std::string& name) { return world().Count(name); }
 
 int LiveHandles() { return static_cast<int>(world().handles.size()); }
 void SetInitFails(bool fails) { world().init_fails = fails; }
@@ -49,15 +40,12 @@ extern "C" void* punctuator_init(const char* model_path, const char* vocab_path,
        {model_path, vocab_path, punc_path, num_path, case_path, xdb_path, bpe_path, lang},
        0});
   if (world().init_fails) return nullptr;
-  // Distinct non-null tokens; never dereferenced.
-  void* handle = reinterpret_cast<void*>(world().next_handle++ << 4);
-  world().handles.insert(handle);
-  return handle;
+  return world().OpenHandle();
 }
 
 extern "C" int punctuator_do_it(void* handle, const char* text, char* out, int32_t* size) {
   world().calls.push_back({"punctuator_do_it", {}, *size});
-  if (!world().handles.count(handle)) return 3;
+  if (!world().IsOpen(handle)) return 3;
   Reply reply;
   if (!world().replies.empty()) {
     reply = world().replies.front();

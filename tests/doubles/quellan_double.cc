@@ -2,25 +2,19 @@
 
 #include <algorithm>
 #include <deque>
-#include <set>
 
+#include "double_state.h"
 #include "quellan_wrap.h"
 
 namespace quellan_double {
 namespace {
 
-struct World {
-  std::vector<Call> calls;
-  std::set<void*> handles;
+struct World : doubles::DoubleState<Call> {
   std::string null_dir = "\x01";
   std::deque<Output> outputs;
-  uintptr_t next_handle = 1;
 };
 
-World& world() {
-  static World w;
-  return w;
-}
+World& world() { return doubles::Instance<World>(); }
 
 }  // namespace
 
@@ -38,17 +32,14 @@ using namespace quellan_double;
 extern "C" void* quellan_create(const char* dir) {
   world().calls.push_back({"quellan_create", 0, 0, 0});
   if (dir != nullptr && dir == world().null_dir) return nullptr;
-  // Distinct non-null tokens; never dereferenced.
-  void* handle = reinterpret_cast<void*>(world().next_handle++ << 4);
-  world().handles.insert(handle);
-  return handle;
+  return world().OpenHandle();
 }
 
 extern "C" int quellan_process_wave(void* handle, int index, const int16_t*, int len, int16_t* out,
                                     int out_capacity, int* out_len, int* speech, int* continued,
                                     int* ended) {
   world().calls.push_back({"quellan_process_wave", index, len, out_capacity});
-  if (!world().handles.count(handle) || world().outputs.empty()) return 0;
+  if (!world().IsOpen(handle) || world().outputs.empty()) return 0;
   const Output o = std::move(world().outputs.front());
   world().outputs.pop_front();
   const int n = std::min(static_cast<int>(o.samples.size()), out_capacity);

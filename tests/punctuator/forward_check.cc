@@ -11,6 +11,7 @@
 #include <string>
 #include <vector>
 
+#include "cpu_dispatch.h"
 #include "punctuator.h"
 
 namespace {
@@ -37,7 +38,7 @@ int main(int argc, char** argv) {
     std::cerr << "usage: " << argv[0] << " MODEL_DIR REFERENCE_TSV [--baseline]\n";
     return 2;
   }
-  kvasr::punct::UseBaselineProducts(baseline);
+  kvasr_common::ForceBaseline(baseline);
   const std::string d = std::string(argv[1]) + "/";
   std::string error;
   const auto p = kvasr::punct::Punctuator::Create(

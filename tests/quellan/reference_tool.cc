@@ -18,7 +18,7 @@
 #include <string>
 #include <vector>
 
-#include "cpu_features.h"
+#include "cpu_dispatch.h"
 #include "model_files.h"
 #include "plp.h"
 #include "vad_dnn.h"
@@ -105,7 +105,7 @@ int RunDnn(char** argv) {
 
 int main(int argc, char** argv) {
   const char* baseline = std::getenv("QUELLAN_BASELINE_LOOPS");
-  if (baseline != nullptr && std::string(baseline) == "1") cpu_force_baseline(true);
+  if (baseline != nullptr && std::string(baseline) == "1") kvasr_common::ForceBaseline(true);
   const std::string command = argc > 1 ? argv[1] : "";
   if (command == "decode" && argc == 4) return Decode(argv[2], argv[3]);
   if (command == "plp" && argc >= 6) return RunPlp(argc, argv);

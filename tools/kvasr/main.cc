@@ -96,13 +96,33 @@ bool ParseChunkMs(const char* text, int* chunk_ms) {
   return true;
 }
 
-// The arguments after the options; false, with the usage, when there are none.
-bool CollectInputs(int argc, char** argv, std::vector<std::string>* inputs) {
+// What ParseCommandLine returns when the subcommand is to run.
+constexpr int kRun = -1;
+
+// Reads one subcommand's options, then the inputs after them. `apply` takes
+// every option but `help` and returns false, having said why, to refuse it.
+// Returns kRun, or the status to exit with: 0 after the usage that `help`
+// asks for, 2 after an unknown option, a refused one or no input.
+template <typename Apply>
+int ParseCommandLine(int argc, char** argv, const struct option* options, int help, Apply apply,
+                     std::vector<std::string>* inputs) {
+  int c;
+  while ((c = getopt_long(argc, argv, "", options, nullptr)) != -1) {
+    if (c == help) {
+      std::fputs(kUsage, stdout);
+      return 0;
+    }
+    if (c == '?') {
+      std::fputs(kUsage, stderr);
+      return 2;
+    }
+    if (!apply(c)) return 2;
+  }
   for (int i = optind; i < argc; ++i) inputs->push_back(argv[i]);
-  if (!inputs->empty()) return true;
+  if (!inputs->empty()) return kRun;
   std::fputs("kvasr: no input given\n", stderr);
   std::fputs(kUsage, stderr);
-  return false;
+  return 2;
 }
 
 // The library logs on standard output; keep that stream for the texts and
@@ -135,9 +155,8 @@ int Transcribe(int argc, char** argv) {
       {nullptr, 0, nullptr, 0}};
   kvasr_cli::TranscribeOptions o;
   bool verbose = false;
-  long n = 0;
-  int c;
-  while ((c = getopt_long(argc, argv, "", kOptions, nullptr)) != -1) {
+  const auto apply = [&](int c) {
+    long n = 0;
     switch (c) {
       case kModel: o.decoder_model = optarg; break;
       case kVadModels: o.vad_dir = optarg; break;
@@ -151,25 +170,23 @@ int Transcribe(int argc, char** argv) {
       case kJson: o.json = true; break;
       case kNoProgress: o.progress = false; break;
       case kVerbose: verbose = true; break;
-      case kChunkMs:
-        if (!ParseChunkMs(optarg, &o.chunk_ms)) return 2;
-        break;
+      case kChunkMs: return ParseChunkMs(optarg, &o.chunk_ms);
       case kSilenceBefore:
       case kSilenceAfter:
         // The engine counts in 32-bit samples: 16 per millisecond.
         if (!ParseInt(optarg, 0, UINT32_MAX / 16, &n)) {
           std::fprintf(stderr, "kvasr: silence limits take milliseconds from 0 to %u\n",
                        UINT32_MAX / 16);
-          return 2;
+          return false;
         }
         (c == kSilenceBefore ? o.max_silence_before_ms : o.max_silence_after_ms) =
             static_cast<uint32_t>(n);
         break;
-      case kHelp: std::fputs(kUsage, stdout); return 0;
-      default: std::fputs(kUsage, stderr); return 2;
     }
-  }
-  if (!CollectInputs(argc, argv, &o.inputs)) return 2;
+    return true;
+  };
+  const int status = ParseCommandLine(argc, argv, kOptions, kHelp, apply, &o.inputs);
+  if (status != kRun) return status;
   return kvasr_cli::RunTranscribe(o, TakeStdoutForResults(verbose));
 }
 
@@ -185,22 +202,19 @@ int Vad(int argc, char** argv) {
                                            {nullptr, 0, nullptr, 0}};
   kvasr_cli::VadOptions o;
   bool verbose = false;
-  int c;
-  while ((c = getopt_long(argc, argv, "", kOptions, nullptr)) != -1) {
+  const auto apply = [&](int c) {
     switch (c) {
       case kVadDir: o.vad_dir = optarg; break;
       case kFrames: o.frames = true; break;
       case kPlot: o.plot_path = optarg; break;
       case kDump: o.dump_dir = optarg; break;
       case kVadVerbose: verbose = true; break;
-      case kVadChunkMs:
-        if (!ParseChunkMs(optarg, &o.chunk_ms)) return 2;
-        break;
-      case kVadHelp: std::fputs(kUsage, stdout); return 0;
-      default: std::fputs(kUsage, stderr); return 2;
+      case kVadChunkMs: return ParseChunkMs(optarg, &o.chunk_ms);
     }
-  }
-  if (!CollectInputs(argc, argv, &o.inputs)) return 2;
+    return true;
+  };
+  const int status = ParseCommandLine(argc, argv, kOptions, kVadHelp, apply, &o.inputs);
+  if (status != kRun) return status;
   return kvasr_cli::RunVadCommand(o, TakeStdoutForResults(verbose));
 }
 

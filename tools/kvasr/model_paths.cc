@@ -1,8 +1,9 @@
 #include "model_paths.h"
 
 #include <limits.h>
-#include <sys/stat.h>
 #include <unistd.h>
+
+#include "file_kind.h"
 
 namespace kvasr_cli {
 namespace {
@@ -17,23 +18,13 @@ std::string ExecutableDir() {
 
 }  // namespace
 
-bool IsFile(const std::string& path) {
-  struct stat st;
-  return stat(path.c_str(), &st) == 0 && S_ISREG(st.st_mode);
-}
-
-bool IsDirectory(const std::string& path) {
-  struct stat st;
-  return stat(path.c_str(), &st) == 0 && S_ISDIR(st.st_mode);
-}
-
 std::string DefaultModelsDir() {
   // Installed: found from the executable, so a moved or unpacked prefix works.
   const std::string installed = ExecutableDir() + "/" KVASR_MODELS_FROM_BINDIR;
-  if (IsDirectory(installed + "/decoder")) return installed;
+  if (kvasr_common::IsDirectory(installed + "/decoder")) return installed;
   // Build tree: the source checkout's models folder.
   const std::string source = KVASR_SOURCE_MODELS_DIR;
-  if (IsDirectory(source + "/decoder")) return source;
+  if (kvasr_common::IsDirectory(source + "/decoder")) return source;
   return std::string();
 }
 

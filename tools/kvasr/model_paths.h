@@ -13,9 +13,6 @@ std::string DefaultModelsDir();
 // `path` made absolute against `base_dir` unless it is absolute or empty.
 std::string ResolveAgainst(const std::string& base_dir, const std::string& path);
 
-bool IsFile(const std::string& path);
-bool IsDirectory(const std::string& path);
-
 }  // namespace kvasr_cli
 
 #endif  // KVASR_TOOLS_KVASR_MODEL_PATHS_H_

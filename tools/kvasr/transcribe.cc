@@ -10,6 +10,7 @@
 #include <cpprest/json.h>
 
 #include "audio_source.h"
+#include "file_kind.h"
 #include "kvasr_offline.h"
 #include "model_paths.h"
 #include "progress.h"
@@ -89,12 +90,12 @@ bool ResolveModels(TranscribeOptions* o) {
   if (o->punct && o->punct_settings.empty()) {
     o->punct_settings = models.empty() ? "" : models + "/punct/en/settings.json";
   }
-  if (!IsFile(o->decoder_model)) {
+  if (!kvasr_common::IsFile(o->decoder_model)) {
     std::fprintf(stderr, "kvasr: decoder model '%s' not found (use --model)\n",
                  o->decoder_model.c_str());
     return false;
   }
-  if (o->vad && !IsDirectory(o->vad_dir)) {
+  if (o->vad && !kvasr_common::IsDirectory(o->vad_dir)) {
     std::fprintf(stderr, "kvasr: VAD model folder '%s' not found (use --vad-models or --no-vad)\n",
                  o->vad_dir.c_str());
     return false;

@@ -6,6 +6,7 @@
 #include <memory>
 
 #include "audio_source.h"
+#include "file_kind.h"
 #include "model_paths.h"
 #include "quellan_conf.h"
 #include "vad_plot.h"
@@ -77,14 +78,14 @@ int RunVadCommand(VadOptions o, FILE* out) {
     std::fputs("kvasr: --plot takes exactly one input\n", stderr);
     return 2;
   }
-  if (!o.dump_dir.empty() && !IsDirectory(o.dump_dir)) {
+  if (!o.dump_dir.empty() && !kvasr_common::IsDirectory(o.dump_dir)) {
     std::fprintf(stderr, "kvasr: '%s' is not a folder\n", o.dump_dir.c_str());
     return 2;
   }
   QuellanConf conf{};
   // The module joins folder and file names into fixed 256-byte fields.
   if (o.vad_dir.size() + sizeof kNetworkFile + 1 > sizeof conf.data_dir ||
-      !IsDirectory(o.vad_dir) || load_quellan_conf(o.vad_dir.c_str(), &conf) != 0) {
+      !kvasr_common::IsDirectory(o.vad_dir) || load_quellan_conf(o.vad_dir.c_str(), &conf) != 0) {
     std::fprintf(stderr, "kvasr: no usable VAD model folder '%s'\n", o.vad_dir.c_str());
     return 1;
   }

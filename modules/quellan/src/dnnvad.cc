@@ -3,19 +3,9 @@
 #include <algorithm>
 #include <cmath>
 #include <cstring>
-#include <new>
-#include <stdexcept>
 
+#include "alloc_zeroed.h"
 #include "quellan_log.h"
-
-namespace {
-
-template <typename T>
-std::unique_ptr<T[]> alloc_zeroed(size_t count) {
-  return std::unique_ptr<T[]>(new (std::nothrow) T[count]());
-}
-
-}  // namespace
 
 Cdnnvad::Cdnnvad(const VadDnnConf& conf)
     : m_max_frames(conf.max_frames),
@@ -34,54 +24,37 @@ Cdnnvad::Cdnnvad(const VadDnnConf& conf)
       m_shift(conf.shift) {
   if (m_max_frames < 1 || m_shift < 1 || m_win_size < 1 || m_skip < 0 || m_feat_dim < 1 ||
       m_head_margin < 0 || m_min_silence < 1 || m_start_offset < 0 || m_end_offset < 0) {
-    QUELLAN_WARN("Invalid detector settings.\n");
-    throw std::runtime_error("init vad failed");
+    QUELLAN_INIT_FAIL("Invalid detector settings.\n");
   }
   const size_t frames = static_cast<size_t>(m_max_frames);
   if (m_energy_gate == 1) {
     m_wav = alloc_zeroed<int16_t>(frames * m_shift);
-    if (!m_wav) {
-      QUELLAN_WARN("Failed to alloc memory for m_wav.\n");
-      throw std::runtime_error("init vad failed");
-    }
+    if (!m_wav) QUELLAN_INIT_FAIL("Failed to alloc memory for m_wav.\n");
     m_client_vad_flag = alloc_zeroed<uint8_t>(frames);
-    if (!m_client_vad_flag) {
-      QUELLAN_WARN("Failed to alloc memory for m_client_vad_flag\n");
-      throw std::runtime_error("init vad failed");
-    }
+    if (!m_client_vad_flag) QUELLAN_INIT_FAIL("Failed to alloc memory for m_client_vad_flag\n");
   }
   m_dnn.reset(load_vaddnn_file(conf.dnn_file));
-  if (!m_dnn) {
-    QUELLAN_WARN("Failed to load vad dnn file[%s].\n", conf.dnn_file);
-    throw std::runtime_error("init vad failed");
-  }
+  if (!m_dnn) QUELLAN_INIT_FAIL("Failed to load vad dnn file[%s].\n", conf.dnn_file);
   if (set_vaddnn_params(m_dnn.get(), m_max_frames, m_start_offset, m_end_offset) != 0) {
-    QUELLAN_WARN("Failed to set_dnn_params\n");
-    throw std::runtime_error("init vad failed");
+    QUELLAN_INIT_FAIL("Failed to set_dnn_params\n");
   }
   if (load_vaddnn_state_weights(m_dnn.get(), conf.state_weights_file) < 0) {
-    QUELLAN_WARN("Failed to load state-weights file[%s].\n", conf.state_weights_file);
-    throw std::runtime_error("init vad failed");
+    QUELLAN_INIT_FAIL("Failed to load state-weights file[%s].\n", conf.state_weights_file);
   }
   if (!(m_skip_score = alloc_zeroed<float>(frames))) {
-    QUELLAN_WARN("Failed to alloc m_skip_score.\n");
-    throw std::runtime_error("init vad failed");
+    QUELLAN_INIT_FAIL("Failed to alloc m_skip_score.\n");
   }
   if (!(m_out_score = alloc_zeroed<float>(frames))) {
-    QUELLAN_WARN("Failed to alloc m_out_score.\n");
-    throw std::runtime_error("init vad failed");
+    QUELLAN_INIT_FAIL("Failed to alloc m_out_score.\n");
   }
   if (!(m_vad_flag = alloc_zeroed<uint8_t>(frames))) {
-    QUELLAN_WARN("Failed to alloc m_vad_flag.\n");
-    throw std::runtime_error("init vad failed");
+    QUELLAN_INIT_FAIL("Failed to alloc m_vad_flag.\n");
   }
   if (!(m_interval_beg = alloc_zeroed<int>(frames))) {
-    QUELLAN_WARN("Failed to alloc m_interval_beg.\n");
-    throw std::runtime_error("init vad failed");
+    QUELLAN_INIT_FAIL("Failed to alloc m_interval_beg.\n");
   }
   if (!(m_interval_end = alloc_zeroed<int>(frames))) {
-    QUELLAN_WARN("Failed to alloc m_interval_end.\n");
-    throw std::runtime_error("init vad failed");
+    QUELLAN_INIT_FAIL("Failed to alloc m_interval_end.\n");
   }
 }
 
@@ -116,6 +89,7 @@ int Cdnnvad::add_wave_data(int index, const int16_t* samples, int len, const flo
   if (samples == nullptr || len < 0 || feat == nullptr || feat_dim < 1 || plp_frames < 0 ||
       tone_frames < 0 || plp_frames > m_max_frames || tone_frames > m_max_frames ||
       consumed == nullptr) {
+    // compat: "Invalide" is the established spelling of this message; hosts match the text.
     QUELLAN_WARN("Invalide input arguments to Cdnnvad::AddWaveData\n");
     return -1;
   }
@@ -165,12 +139,13 @@ int Cdnnvad::add_wave_data(int index, const int16_t* samples, int len, const flo
 
 int Cdnnvad::client_detect_speech(int index, const int16_t* samples, int len) {
   if (samples == nullptr || len < 1) {
+    // compat: "Invalide" is the established spelling of this message; hosts match the text.
     QUELLAN_WARN("Invalide input arguments for client_detect_speech\n");
     return -1;
   }
   const int frames = m_last - m_first + 1;
-  // The accumulator is deliberately not cleared between frames: each
-  // frame's sum starts from the previous frame's level in dB.
+  // Each frame's sum starts from the previous frame's level in dB.
+  // compat: the sum is not cleared between frames; clearing it moves every energy-gate decision.
   float acc = 0.0f;
   for (int j = 0; j < frames; ++j) {
     const int sta = j * m_shift;
@@ -234,6 +209,7 @@ void Cdnnvad::fill_frame_scores() {
     for (int s = 0; s <= m_skip; ++s) out[f + s] = m_skip_score[n];
     f += m_skip + 1;
   }
+  // compat: reset() keeps m_last_score; clearing it changes each later utterance's first scores.
   if (m_score_num > 0) m_last_score = m_skip_score[m_score_num - 1];
   for (; f <= m_last; ++f) out[f] = m_last_score;
 }
@@ -329,9 +305,8 @@ void Cdnnvad::segment_between_intervals(const VadOutputLists& lists) {
   for (int i = 1; i < m_interval_num; ++i) {
     const int prev_end = m_interval_end[i - 1];
     const int next_beg = m_interval_beg[i];
-    // The gap holds next_beg - prev_end non-speech frames; the + 1 makes a
-    // gap inside one batch close a segment one frame sooner than silence
-    // counted across calls. Established behaviour, kept on purpose.
+    // The gap holds next_beg - prev_end non-speech frames.
+    // compat: + 1 closes an in-batch gap a frame sooner than across calls; dropping it moves ends.
     if (next_beg - prev_end + 1 < m_min_silence) continue;
     const int cut = base + prev_end + (next_beg - prev_end - 1) / 2;
     cut_at(cut, lists);

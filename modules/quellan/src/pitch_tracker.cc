@@ -12,7 +12,6 @@ constexpr int kInitialFill = 20;  // every stream starts 2.5 ms late
 constexpr int kDecimatedSamples = kPitchFrameSamples / 2;
 constexpr int kResetAnalysisSamples = 140;
 constexpr int kFftSize = 256;
-constexpr int kLastBin = kPowerBins - 1;
 // The window's 2 pi is the single-precision constant, widened.
 constexpr double kTwoPi = 6.2831854820251465;
 constexpr double kMinEnergy = 0.00019284;

@@ -10,7 +10,6 @@ namespace {
 
 constexpr float kBinHz = kPitchSampleRateHz / 256.0f;  // 256-point transform
 constexpr float kFilteredRateHz = 2000.0f;
-constexpr int kLastBin = kPowerBins - 1;
 
 // Candidate grid, log-spaced so that every octave is resolved alike.
 constexpr float kMinF0Hz = 60.0f;

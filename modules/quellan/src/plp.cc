@@ -4,9 +4,8 @@
 #include <cmath>
 #include <cstring>
 #include <limits>
-#include <new>
-#include <stdexcept>
 
+#include "alloc_zeroed.h"
 #include "quellan_log.h"
 
 namespace {
@@ -17,9 +16,14 @@ constexpr float kStaticClip = 50.0f;
 constexpr int kDeltaWindowFrames = 2;
 constexpr float kDeltaDivisor = 10.0f;  // 2 * (1^2 + 2^2)
 constexpr float kFilterbankFloor = 1.0f;
-constexpr double kMinStdDev = 0.01;
 
-double mel(double hz) { return 1127.0 * std::log(1.0 + hz / 700.0); }
+// The mel scale, with frequencies also given as multiples of its corner.
+constexpr double kMelScale = 1127.0;
+constexpr double kMelCornerHz = 700.0;
+
+double mel_of_corners(double corners) { return kMelScale * std::log(1.0 + corners); }
+double mel(double hz) { return mel_of_corners(hz / kMelCornerHz); }
+double hz_of_mel(double m) { return kMelCornerHz * (std::exp(m / kMelScale) - 1.0); }
 
 float clip_static(float v) {
   return v > kStaticClip ? kStaticClip : (v < -kStaticClip ? -kStaticClip : v);
@@ -28,24 +32,20 @@ float clip_static(float v) {
 }  // namespace
 
 PLP::PLP(const PlpConfig* conf, FILE* cmsfp) {
-  if (load_base_info_cmsfp(this, conf, cmsfp) != 0) {
-    QUELLAN_WARN("Failed to load base info\n");
-    throw std::runtime_error("init vad failed");
-  }
+  if (load_base_info_cmsfp(this, conf, cmsfp) != 0) QUELLAN_INIT_FAIL("Failed to load base info\n");
   build_tables();
   const size_t tgt_floats = static_cast<size_t>(conf_.feat_dim) * conf_.max_frame_num;
-  m_tgt_.reset(new (std::nothrow) float[tgt_floats]());
+  m_tgt_ = alloc_zeroed<float>(tgt_floats);
   if (!m_tgt_) {
-    QUELLAN_WARN("Failed to alloc memory for m_tgt, size[%lu]\n",
-                 static_cast<unsigned long>(tgt_floats * sizeof(float)));
-    throw std::runtime_error("init vad failed");
+    QUELLAN_INIT_FAIL("Failed to alloc memory for m_tgt, size[%lu]\n",
+                      static_cast<unsigned long>(tgt_floats * sizeof(float)));
   }
   const size_t static_floats = static_cast<size_t>(static_dim_) * conf_.max_frame_num;
-  static_buf_.reset(new (std::nothrow) float[static_floats]());
+  static_buf_ = alloc_zeroed<float>(static_floats);
   if (!static_buf_) {
-    QUELLAN_WARN("Failed to alloc memory for m_tgt, size[%lu]\n",
-                 static_cast<unsigned long>(static_floats * sizeof(float)));
-    throw std::runtime_error("init vad failed");
+    // compat: names m_tgt, as this message always has; hosts match the text.
+    QUELLAN_INIT_FAIL("Failed to alloc memory for m_tgt, size[%lu]\n",
+                      static_cast<unsigned long>(static_floats * sizeof(float)));
   }
 }
 
@@ -57,7 +57,8 @@ void PLP::build_tables() {
   const int half_n = fft_n_ / 2;
   const int num_chans = conf_.num_chans;
 
-  const double bin_mel_step = 1e7 / (conf_.src_period * fft_n_ * 700.0);
+  // One bin's width, in multiples of the mel scale's corner frequency.
+  const double bin_corners = 1e7 / (conf_.src_period * fft_n_ * kMelCornerHz);
   double mlo = 0.0;
   first_bin_ = 2;
   if (conf_.lo_freq >= 0.0f) {
@@ -81,7 +82,7 @@ void PLP::build_tables() {
   std::vector<int> bin_chan(half_n + 1, 0);
   bin_weight_.assign(half_n + 1, 0.0f);
   for (int k = first_bin_; k <= last_bin_; ++k) {
-    const double m = 1127.0 * std::log(1.0 + (k - 1) * bin_mel_step);
+    const double m = mel_of_corners((k - 1) * bin_corners);
     int ch = 0;
     while (ch + 1 <= num_chans + 1 && centre[ch + 1] < m) ++ch;
     bin_chan[k] = ch;
@@ -96,7 +97,7 @@ void PLP::build_tables() {
 
   loudness_.assign(num_chans + 1, 0.0f);
   for (int j = 1; j <= num_chans; ++j) {
-    const double f = 700.0 * (std::exp(centre[j] / 1127.0) - 1.0);
+    const double f = hz_of_mel(centre[j]);
     const double s = f * f;
     const double ratio = s / (s + 1.6e5);
     loudness_[j] = static_cast<float>(ratio * ratio * (s + 1.44e6) / (s + 9.61e6));

@@ -59,6 +59,10 @@ class PLP {
   const std::vector<float>& running_variance() const { return run_var_; }
 
  private:
+  // Floor of a standard deviation that divides a normalised feature: both
+  // normalisations use it, the running one at single precision.
+  static constexpr double kMinStdDev = 0.01;
+
   friend int load_base_info_cmsfp(PLP* plp, const PlpConfig* conf, FILE* cmsfp);
 
   void build_tables();

@@ -13,7 +13,6 @@ constexpr float kRunningRate = 0.01f;
 constexpr float kRunningKeep = 0.99f;
 // 0.99 * 0.01: the weight of the squared deviation from the previous mean.
 constexpr float kRunningVarRate = 0.0099f;
-constexpr float kMinStdDev = 0.01f;
 
 }  // namespace
 
@@ -93,6 +92,7 @@ int load_base_info_cmsfp(PLP* plp, const PlpConfig* conf, FILE* cmsfp) {
 }
 
 void PLP::update_running(float* vector) {
+  const float min_sd = static_cast<float>(kMinStdDev);
   for (int i = 0; i < cms_dim_; ++i) {
     const float x = vector[i];
     const float mean = run_mean_[i];
@@ -100,7 +100,7 @@ void PLP::update_running(float* vector) {
     const float new_mean = kRunningRate * x + kRunningKeep * mean;
     const float new_var = kRunningKeep * run_var_[i] + kRunningVarRate * deviation * deviation;
     float sd = std::sqrt(new_var);
-    if (sd < kMinStdDev) sd = kMinStdDev;
+    if (sd < min_sd) sd = min_sd;
     vector[i] = (x - new_mean) / sd;
     run_mean_[i] = new_mean;
     run_var_[i] = new_var;

@@ -3,9 +3,10 @@
 #include <algorithm>
 #include <cstdio>
 #include <cstring>
+#include <exception>
 #include <new>
-#include <stdexcept>
 
+#include "alloc_zeroed.h"
 #include "quellan_log.h"
 
 namespace {
@@ -14,11 +15,6 @@ namespace {
 // back over the detector's context, a carried closing silence and the head
 // margin: well under a hundred frames with the built-in settings.
 constexpr int kHistoryGuardFrames = 256;
-
-template <typename T>
-std::unique_ptr<T[]> alloc_zeroed(size_t count) {
-  return std::unique_ptr<T[]>(new (std::nothrow) T[count]());
-}
 
 }  // namespace
 
@@ -32,23 +28,18 @@ Cquellan::Cquellan(const QuellanConf& conf)
       out_wav_num(conf.out_wav_num) {
   if (conf.max_frames < 1 || conf.frame_shift < 1 || conf.feat_dim < 1 || conf.out_wav_len < 0 ||
       conf.out_wav_num < 1) {
-    QUELLAN_WARN("Invalid pipeline settings.\n");
-    throw std::runtime_error("init vad failed");
+    QUELLAN_INIT_FAIL("Invalid pipeline settings.\n");
   }
   m_wav_history = alloc_zeroed<int16_t>(static_cast<size_t>(m_history_capacity));
   wav_reserve = alloc_zeroed<int16_t>(static_cast<size_t>(m_wav_capacity));
   if (!m_wav_history || !wav_reserve) {
-    // Established wording, although it names another object.
-    QUELLAN_WARN("failed to new Vortaf0Interface.\n");
-    throw std::runtime_error("init vad failed");
+    // compat: established wording, though it names another object; hosts match the text.
+    QUELLAN_INIT_FAIL("failed to new Vortaf0Interface.\n");
   }
   FILE* cmsfp = nullptr;
   if (conf.plp.cms_mode == 1) {
     cmsfp = std::fopen(conf.plp.cms_path, "rb");
-    if (cmsfp == nullptr) {
-      QUELLAN_WARN("error opening cms.bin to read\n");
-      throw std::runtime_error("init vad failed");
-    }
+    if (cmsfp == nullptr) QUELLAN_INIT_FAIL("error opening cms.bin to read\n");
   }
   try {
     m_plp = std::make_unique<PLP>(&conf.plp, cmsfp);
@@ -62,17 +53,15 @@ Cquellan::Cquellan(const QuellanConf& conf)
   m_frame_shift = m_plp->frame_shift_samples();
   m_plp_delay = m_plp->delay_frames();
   if (m_plp_dim != m_feat_dim || m_frame_shift != conf.frame_shift) {
-    QUELLAN_WARN("PLP rows [%d x %d] do not match the feature matrix [%d x %d].\n", m_plp_dim,
-                 m_frame_shift, m_feat_dim, conf.frame_shift);
-    throw std::runtime_error("init vad failed");
+    QUELLAN_INIT_FAIL("PLP rows [%d x %d] do not match the feature matrix [%d x %d].\n", m_plp_dim,
+                      m_frame_shift, m_feat_dim, conf.frame_shift);
   }
   m_use_tone = conf.use_pitch;
   if (m_use_tone != 0) {
     try {
       m_tone = std::make_unique<Vortaf0Interface>(conf.pitch, m_wav_capacity);
     } catch (const std::bad_alloc&) {
-      QUELLAN_WARN("failed to new Vortaf0Interface.\n");
-      throw std::runtime_error("init vad failed");
+      QUELLAN_INIT_FAIL("failed to new Vortaf0Interface.\n");
     }
     // Tone columns follow the PLP columns of each row.
     m_tone->SetToneFeatureOffset(conf.plp.feat_dim);
@@ -82,10 +71,7 @@ Cquellan::Cquellan(const QuellanConf& conf)
   }
   // Allocated once the row width is known.
   m_feat = alloc_zeroed<float>(static_cast<size_t>(m_max_frames) * m_feat_dim);
-  if (!m_feat) {
-    QUELLAN_WARN("failed to alloc m_feat.\n");
-    throw std::runtime_error("init vad failed");
-  }
+  if (!m_feat) QUELLAN_INIT_FAIL("failed to alloc m_feat.\n");
   VadDnnConf vad_conf = conf.vad;
   // The network reads whole rows, tone columns included.
   vad_conf.feat_dim += m_tone_dim;
@@ -94,18 +80,14 @@ Cquellan::Cquellan(const QuellanConf& conf)
   out_wav.resize(out_wav_num);
   for (int i = 0; i < out_wav_num; ++i) {
     out_wav[i] = alloc_zeroed<int16_t>(out_wav_len);
-    if (!out_wav[i]) {
-      QUELLAN_WARN("failed to alloc out_wav[%d]\n", i);
-      throw std::runtime_error("init vad failed");
-    }
+    if (!out_wav[i]) QUELLAN_INIT_FAIL("failed to alloc out_wav[%d]\n", i);
   }
   m_out_len = alloc_zeroed<int>(out_wav_num);
   m_seg_beg = alloc_zeroed<int>(out_wav_num);
   m_seg_end = alloc_zeroed<int>(out_wav_num);
   m_cut_frame = alloc_zeroed<int>(out_wav_num);
   if (!m_out_len || !m_seg_beg || !m_seg_end || !m_cut_frame) {
-    QUELLAN_WARN("failed to alloc the interval lists.\n");
-    throw std::runtime_error("init vad failed");
+    QUELLAN_INIT_FAIL("failed to alloc the interval lists.\n");
   }
 }
 
@@ -247,6 +229,7 @@ int Cquellan::quellan_process(int index, const int16_t* samples, int len, int16_
                               int* ended) {
   if (samples == nullptr || out == nullptr || len < 0 || out_capacity < 0 || out_len == nullptr ||
       speech == nullptr || continued == nullptr || ended == nullptr) {
+    // compat: "Invalide" is the established spelling of this message; hosts match the text.
     QUELLAN_WARN("Invalide input arguments.\n");
     return 0;
   }
@@ -287,8 +270,7 @@ int Cquellan::quellan_process(int index, const int16_t* samples, int len, int16_
 
   for (int i = 1; i < m_seg_num; ++i) m_seg_beg[i] = m_seg_end[i - 1] + 1;
 
-  // A call that completes no frame leaves the lists as they were, so it
-  // reports the previous call's intervals once more.
+  // compat: a call that completes no frame reports the previous call's intervals once more.
   *out_len = 0;
   *speech = 0;
   *continued = 0;

@@ -3,6 +3,7 @@
 #define QUELLAN_LOG_H_
 
 #include <cstdio>
+#include <stdexcept>
 
 namespace quellan {
 
@@ -24,5 +25,14 @@ constexpr const char* source_path(const char* file) {
 #define QUELLAN_WARN(format, ...)                                                         \
   std::fprintf(stdout, "WARNING * [%s:%d<<%s>>] " format, quellan::source_path(__FILE__), \
                __LINE__, __func__, ##__VA_ARGS__)
+
+// A constructor that cannot build its object: the warning line, then the one
+// exception every constructor of the module throws. A macro so that the line
+// names the constructor, not a helper.
+#define QUELLAN_INIT_FAIL(format, ...)           \
+  do {                                           \
+    QUELLAN_WARN(format, ##__VA_ARGS__);         \
+    throw std::runtime_error("init vad failed"); \
+  } while (0)
 
 #endif  // QUELLAN_LOG_H_

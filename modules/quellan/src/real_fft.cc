@@ -4,7 +4,7 @@
 
 #include <cmath>
 
-#include "cpu_features.h"
+#include "cpu_dispatch.h"
 
 RealFft::RealFft(int fft_n)
     : fft_n_(fft_n),
@@ -127,8 +127,10 @@ void later_stages_baseline(int n, double* re, double* im, const double* tw_re,
 }  // namespace
 
 void RealFft::later_stages(double* re, double* im) const {
-  (cpu_has_avx() ? later_stages_avx : later_stages_baseline)(fft_n_, re, im, twiddle_re_.data(),
-                                                             twiddle_im_.data());
+  if (kvasr_common::HasAvx()) {
+    return later_stages_avx(fft_n_, re, im, twiddle_re_.data(), twiddle_im_.data());
+  }
+  later_stages_baseline(fft_n_, re, im, twiddle_re_.data(), twiddle_im_.data());
 }
 
 // The trimmed arithmetic of the first stages only drops additions of zero

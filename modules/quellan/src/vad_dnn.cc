@@ -7,7 +7,7 @@
 #include <cstdlib>
 #include <cstring>
 
-#include "cpu_features.h"
+#include "cpu_dispatch.h"
 #include "quellan_log.h"
 
 namespace {
@@ -99,8 +99,10 @@ void layer_product_baseline(const float* in, int rows, int in_dim, const float* 
 
 void layer_product(const float* in, int rows, int in_dim, const float* weights, int out_dim,
                    float alpha, float beta, float* out) {
-  (cpu_has_avx() ? layer_product_avx : layer_product_baseline)(in, rows, in_dim, weights, out_dim,
-                                                               alpha, beta, out);
+  if (kvasr_common::HasAvx()) {
+    return layer_product_avx(in, rows, in_dim, weights, out_dim, alpha, beta, out);
+  }
+  layer_product_baseline(in, rows, in_dim, weights, out_dim, alpha, beta, out);
 }
 
 void fill_bias(const VadDnnLayer& layer, int rows) {
@@ -322,6 +324,7 @@ int set_vaddnn_feature(VadDnn* dnn, const float* feat, int feat_dim, int t0, int
                        int total, int skip, int* rows) {
   if (dnn == nullptr || feat == nullptr || rows == nullptr || feat_dim < 1 || total < 1 ||
       skip < 0 || dnn->input_buffer == nullptr) {
+    // compat: "Invalide" is the established spelling of this message; hosts match the text.
     QUELLAN_WARN("Invalide input arguments.\n");
     return -1;
   }
@@ -355,6 +358,7 @@ int set_vaddnn_feature(VadDnn* dnn, const float* feat, int feat_dim, int t0, int
 int calc_vaddnn_prob(VadDnn* dnn, int rows, float* score) {
   if (dnn == nullptr || rows <= 0 || score == nullptr || rows > dnn->max_frames ||
       dnn->input_buffer == nullptr || dnn->state_weights == nullptr) {
+    // compat: "Invalide" is the established spelling of this message; hosts match the text.
     QUELLAN_WARN("Invalide input arguments.\n");
     return -1;
   }

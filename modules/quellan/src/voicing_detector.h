@@ -7,6 +7,7 @@
 
 constexpr int kMelBands = 23;
 constexpr int kPowerBins = 129;
+constexpr int kLastBin = kPowerBins - 1;
 constexpr int kAnalysisSamples = 200;
 constexpr int kPitchSamples2kHz = 80;
 constexpr int kFilteredHistorySamples = 320;

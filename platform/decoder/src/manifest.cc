@@ -7,6 +7,7 @@
 #include <cstring>
 #include <map>
 
+#include "file_kind.h"
 #include "kvasr_decoder_constants.h"
 
 namespace kvasr::decoder {
@@ -35,16 +36,6 @@ std::string Trim(const std::string& s) {
   const size_t first = s.find_first_not_of(kSpace);
   if (first == std::string::npos) return "";
   return s.substr(first, s.find_last_not_of(kSpace) - first + 1);
-}
-
-bool IsRegularFile(const std::string& path) {
-  struct stat st;
-  return stat(path.c_str(), &st) == 0 && S_ISREG(st.st_mode);
-}
-
-bool IsDirectory(const std::string& path) {
-  struct stat st;
-  return stat(path.c_str(), &st) == 0 && S_ISDIR(st.st_mode);
 }
 
 // Path of the file behind `file`, or nothing. Only a FILE* is given, so the
@@ -193,7 +184,7 @@ class Parser {
 
   bool ResolveFile(const std::string& key, std::string* path) const {
     if (!Resolve(key, path)) return false;
-    if (!path->empty() && !IsRegularFile(*path)) {
+    if (!path->empty() && !kvasr_common::IsFile(*path)) {
       Fail(entries_.at(key).line, key + " \"" + *path + "\" is not a readable file");
       return false;
     }
@@ -229,18 +220,18 @@ class Parser {
   bool CheckAcousticModel() const {
     const std::string& dir = settings_.acoustic_model_dir;
     const int line = entries_.at("acoustic_model").line;
-    if (!IsDirectory(dir)) {
+    if (!kvasr_common::IsDirectory(dir)) {
       Fail(line, "acoustic_model \"" + dir + "\" is not a directory");
       return false;
     }
     for (const char* name : kAcousticModelFiles) {
-      if (!IsRegularFile(dir + "/" + name)) {
+      if (!kvasr_common::IsFile(dir + "/" + name)) {
         Fail(line, "acoustic model \"" + dir + "\" has no file \"" + name + "\"");
         return false;
       }
     }
     for (const char* name : kMixtureWeightFiles) {
-      if (IsRegularFile(dir + "/" + name)) return true;
+      if (kvasr_common::IsFile(dir + "/" + name)) return true;
     }
     Fail(line, "acoustic model \"" + dir +
                    "\" has neither \"sendump\" nor "

@@ -1,11 +1,12 @@
 #include "network.h"
 
 #include <algorithm>
-#include <atomic>
 #include <cmath>
 #include <cstring>
 #include <fstream>
 #include <iterator>
+
+#include "cpu_dispatch.h"
 
 namespace kvasr {
 namespace punct {
@@ -125,17 +126,6 @@ __attribute__((always_inline)) inline void ProductTiles(const float* const* in, 
   }
 }
 
-// Set by UseBaselineProducts.
-std::atomic<bool> g_baseline_only{false};
-
-// The processor's answer is taken once, at first use: resolvers run by the
-// loader (ifunc) come before sanitizer runtimes are ready, and "arch="
-// clones dispatch on the CPU model rather than its features.
-bool UseAvx2() {
-  static const bool has = __builtin_cpu_supports("avx2") && __builtin_cpu_supports("fma");
-  return has && !g_baseline_only.load(std::memory_order_relaxed);
-}
-
 __attribute__((target("avx2,fma"))) void RowsProductAvx2(const float* const* in, int parts,
                                                          size_t cin, const float* w, size_t stride,
                                                          const float* bias, size_t cout,
@@ -152,7 +142,9 @@ __attribute__((target("avx2,fma"))) void StateProductAvx2(const float* in, size_
 
 void RowsProduct(const float* const* in, int parts, size_t cin, const float* w, size_t stride,
                  const float* bias, size_t cout, float* const* out) {
-  if (UseAvx2()) return RowsProductAvx2(in, parts, cin, w, stride, bias, cout, out);
+  if (kvasr_common::HasAvx2Fma()) {
+    return RowsProductAvx2(in, parts, cin, w, stride, bias, cout, out);
+  }
   ProductTiles<Lanes4, kTimeBlock, kRowsOutBlockBaseline>(in, parts, cin, w, stride, bias, cout,
                                                           out);
 }
@@ -160,7 +152,7 @@ void RowsProduct(const float* const* in, int parts, size_t cin, const float* w, 
 // The product of the recurrent state (one row) with a gate matrix.
 void StateProduct(const float* in, size_t cin, const float* w, size_t stride, const float* bias,
                   size_t cout, float* out) {
-  if (UseAvx2()) return StateProductAvx2(in, cin, w, stride, bias, cout, out);
+  if (kvasr_common::HasAvx2Fma()) return StateProductAvx2(in, cin, w, stride, bias, cout, out);
   ProductTiles<Lanes4, 1, kStateOutBlockBaseline>(&in, 1, cin, w, stride, bias, cout, &out);
 }
 
@@ -183,8 +175,6 @@ std::vector<float> Padded(std::vector<float> v, size_t size) {
 float Sigmoid(float x) { return 1.0f / (1.0f + std::exp(-x)); }
 
 }  // namespace
-
-void UseBaselineProducts(bool on) { g_baseline_only.store(on, std::memory_order_relaxed); }
 
 bool Network::Load(const std::string& path, std::string* error) {
   std::ifstream in(path, std::ios::binary);

@@ -35,11 +35,6 @@ struct WordInput {
   const int32_t* pieces = nullptr;
 };
 
-// Makes every Network in the process run its products with the baseline
-// (SSE) code even where AVX2 is available, so tests can check the path that
-// older processors take. Off by default.
-void UseBaselineProducts(bool on);
-
 class Network {
  public:
   // False with a reason in `error` when the file is missing, truncated,
