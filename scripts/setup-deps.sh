@@ -25,7 +25,9 @@ test=(
   # Sanitizers, fuzzers and the formatting check.
   clang llvm libclang-rt-dev clang-format
   binutils
-  python3 python3-numpy python3-soundfile python3-pytest
+  python3 python3-numpy python3-soundfile
+  # The Python module's tests, its pip install among them.
+  python3-pytest python3-pip python3-setuptools python3-wheel
   # cpack's dependency scan of the Debian packages.
   file
 )

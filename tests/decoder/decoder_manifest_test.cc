@@ -146,6 +146,69 @@ TEST_F(DecoderManifest, RelativePathsAreTakenFromTheManifestsOwnFolder) {
   fclose(file);
 }
 
+// A base manifest in the test folder and a grammar beside it.
+class DecoderManifestBase : public DecoderManifest {
+ protected:
+  fs::path WriteFile(const std::string& name, const std::string& text) {
+    const fs::path path = dir_ / name;
+    std::ofstream(path, std::ios::binary | std::ios::trunc) << text;
+    return path;
+  }
+
+  fs::path WriteGrammar(const std::string& body) {
+    return WriteFile("commands.gram", "#JSGF V1.0;\ngrammar commands;\n" + body);
+  }
+
+  static std::string OnBase(const std::string& lines) {
+    return kTag + "base = base.manifest\n" + lines;
+  }
+
+  void SetUp() override { WriteFile("base.manifest", kValid + "option.beam = 1e-40\n"); }
+};
+
+TEST_F(DecoderManifestBase, AManifestTakesWhatItDoesNotNameFromItsBase) {
+  WriteGrammar("public <c> = go (forward | back) [ten meters] | stop;\n");
+  for (const std::string& text :
+       {OnBase(""), OnBase("grammar = commands.gram\n"), OnBase("option.beam = 1e-48\n"),
+        // The base's own relative paths are its folder's, not the child's.
+        kTag + "base = " + (dir_ / "base.manifest").string() + "\n" + kLanguageModel}) {
+    SCOPED_TRACE(text);
+    const InitOutcome outcome = InitFromPath(Write(text));
+    EXPECT_NE(outcome.handle, nullptr);
+    EXPECT_EQ(outcome.error_output, "");
+    mwDecoderDestroy(outcome.handle);
+  }
+}
+
+TEST_F(DecoderManifestBase, FaultsOfBasesAndGrammarsSayWhere) {
+  const struct {
+    std::string grammar;
+    std::string manifest;
+    std::string fragment;
+  } cases[] = {
+      {"", kTag + "base = missing.manifest\n",
+       "line 2: base \"" + dir_.string() + "/missing.manifest\" is not a readable file"},
+      {"", kTag + "base = model.manifest\n", "nested more than 8 deep"},
+      {"", OnBase("grammar = commands.gram\nlanguage_model = x\n"), "exactly one of"},
+      {"", OnBase("dictionary = /nonexistent.dict\n"), "\"/nonexistent.dict\" is not a readable"},
+      {"public <c> = go forward;\n", kTag + "base = commands.gram\n",
+       "commands.gram line 1: first line must be"},
+      // Quoted, commented and tagged text around the word, which is the
+      // second one missing; its first mention is a comment.
+      {"// florp\n<x> = \"go\" {tag} /2/ forward;\npublic <c> = <x>\n  | stop florp;\n",
+       OnBase("grammar = commands.gram\n"),
+       "grammar \"" + dir_.string() +
+           "/commands.gram\" line 6: word \"florp\" is not in the dictionary"},
+      {"<c> = go forward;\n", OnBase("grammar = commands.gram\n"), "has no public rule"},
+      {"public <c> = go (forward;\n", OnBase("grammar = commands.gram\n"), "is not valid JSGF"},
+  };
+  for (const auto& c : cases) {
+    SCOPED_TRACE(c.fragment);
+    WriteGrammar(c.grammar);
+    ExpectRejected(InitFromPath(Write(c.manifest)), c.fragment);
+  }
+}
+
 TEST(DecoderVersion, NamesThisLibraryAndTheRecogniser) {
   const std::string version = mwGetVersion();
   EXPECT_EQ(version.rfind("kvasr_decoder ", 0), 0u) << version;

@@ -55,8 +55,52 @@ PY
 expect "raw sound from standard input" 0 "forward" - -- \
   sh -c "\"$kvasr\" transcribe --model \"$manifest\" --no-vad - < $data/goforward.raw"
 
-expect "json messages with a final one" 0 '"isBreak":true,"text":"[^"]+"\},"status":0\}$' - -- \
-  "$kvasr" transcribe "${common[@]}" --json "$clip"
+expect "version of the project and of the decoder library" 0 "^kvasr [0-9]+\.[0-9]+\.[0-9]+$" - -- \
+  "$kvasr" --version
+if ! grep -q "^decoder: kvasr_decoder .*PocketSphinx" "$work/out"; then
+  echo "FAIL --version names the decoder library"
+  failures=$((failures + 1))
+fi
+
+# JSON Lines: every line one object naming its input, each input's last
+# message a final text.
+expect "json lines over two inputs" 0 '"isBreak":true' - -- \
+  "$kvasr" transcribe "${common[@]}" --json "$clip" "$work/stereo44k.wav"
+if ! python3 - "$work/out" "$clip" "$work/stereo44k.wav" <<'PY'; then
+import json, sys
+lines = open(sys.argv[1]).read().splitlines()
+messages = [json.loads(line) for line in lines]
+assert all(isinstance(m, dict) and "\n" not in line for m, line in zip(messages, lines))
+by_input = {}
+for m in messages:
+    by_input.setdefault(m["input"], []).append(m)
+assert list(by_input) == sys.argv[2:], list(by_input)
+for ms in by_input.values():
+    assert ms[-1]["result"]["isBreak"] and "young man" in ms[-1]["result"]["text"], ms[-1]
+PY
+  echo "FAIL json lines: not one object per line naming its input"
+  failures=$((failures + 1))
+fi
+
+expect "a WAV file on standard input is read by its header" 0 "^He was not .*young man[.?!]$" - -- \
+  sh -c "\"$kvasr\" transcribe --model \"$manifest\" --no-vad --punct - < $work/stereo44k.wav"
+
+# Every other sample: 8 kHz.
+python3 - "$clip" "$work/8k.wav" <<'PY'
+import array, sys, wave
+with wave.open(sys.argv[1]) as w:
+    samples = array.array("h", w.readframes(w.getnframes()))[::2]
+with wave.open(sys.argv[2], "wb") as w:
+    w.setnchannels(1); w.setsampwidth(2); w.setframerate(8000)
+    w.writeframes(samples.tobytes())
+PY
+expect "one warning for narrowband sound, which is still transcribed" 0 "[a-z]" \
+  "^kvasr: $work/8k.wav: warning: 8000 Hz is below 16000 Hz; the model is wideband" -- \
+  "$kvasr" transcribe "${common[@]}" "$work/8k.wav"
+if [ "$(wc -l <"$work/err")" -ne 1 ]; then
+  echo "FAIL narrowband: one warning line expected"
+  failures=$((failures + 1))
+fi
 
 echo "not sound" >"$work/text.wav"
 expect "a missing file and a text file fail alone" 1 "^$work/stereo44k.wav	.*young man" \
@@ -79,6 +123,20 @@ expect "a missing VAD model folder" 2 - "^kvasr: VAD model folder '/nonexistent'
 
 expect "missing punctuation settings" 2 - "^kvasr: punctuation settings '/nonexistent.json' cannot be read" -- \
   "$kvasr" transcribe "${common[@]}" --punct-settings /nonexistent.json "$clip"
+
+# The shipped command grammar, beside the default manifest: once through
+# --grammar, once through its own manifest.
+models=$(dirname "$manifest")
+expect "a command grammar through --grammar" 0 "^go forward ten meters$" - -- \
+  sh -c "\"$kvasr\" transcribe --model \"$manifest\" --grammar $models/commands.gram - < $data/goforward.raw"
+expect "a command grammar through its manifest" 0 "^go forward ten meters$" - -- \
+  sh -c "\"$kvasr\" transcribe --model $models/commands.manifest - < $data/goforward.raw"
+printf '#JSGF V1.0;\ngrammar g;\npublic <c> = go forward\n  | go zorblax;\n' >"$work/unknown.gram"
+expect "a grammar word missing from the dictionary" 2 - \
+  "^kvasr_decoder: grammar \"$work/unknown.gram\" line 4: word \"zorblax\" is not in the dictionary" -- \
+  "$kvasr" transcribe "${common[@]}" --grammar "$work/unknown.gram" "$clip"
+expect "a missing grammar" 2 - "^kvasr: grammar '/nonexistent.gram' not found" -- \
+  "$kvasr" transcribe "${common[@]}" --grammar /nonexistent.gram "$clip"
 
 expect "bad chunk size" 2 - "chunk-ms" -- "$kvasr" transcribe "${common[@]}" --chunk-ms 0 "$clip"
 expect "no input" 2 - "no input given" -- "$kvasr" transcribe "${common[@]}"

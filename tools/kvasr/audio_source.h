@@ -1,5 +1,6 @@
-// Sound for the engine: any file libsndfile reads, or raw 16 kHz s16le mono
-// from standard input, delivered as 16 kHz mono 16-bit chunks.
+// Sound for the engine: any file libsndfile reads, from a path or standard
+// input (where a stream without a container header is raw 16 kHz s16le
+// mono), delivered as 16 kHz mono 16-bit chunks.
 #ifndef KVASR_TOOLS_KVASR_AUDIO_SOURCE_H_
 #define KVASR_TOOLS_KVASR_AUDIO_SOURCE_H_
 
@@ -20,6 +21,8 @@ class AudioSource {
   virtual bool Read(size_t samples, std::vector<int16_t>* chunk) = 0;
   // Length in seconds at 16 kHz, or a negative value when unknown.
   virtual double duration_s() const = 0;
+  // The rate of the recording before conversion.
+  virtual int rate_hz() const = 0;
   const std::string& error() const { return error_; }
 
  protected:

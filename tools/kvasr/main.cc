@@ -22,21 +22,26 @@ constexpr char kUsage[] =
     "usage: kvasr transcribe [options] FILE...\n"
     "       kvasr vad [vad options] FILE...\n"
     "       kvasr pitch FILE\n"
-    "       kvasr version\n"
+    "       kvasr --version\n"
     "\n"
     "Transcribes WAV, FLAC or OGG files (any rate and channel count), or raw\n"
-    "16 kHz 16-bit mono little-endian sound from standard input for '-'.\n"
+    "sound from standard input for '-' (a container such as WAV is recognised by\n"
+    "its header; anything else is taken as raw 16 kHz 16-bit mono little-endian).\n"
     "Prints the final texts, one per line (prefixed by the file name and a tab\n"
-    "when several inputs are given).\n"
+    "when several inputs are given). Below 16 kHz a warning says that accuracy\n"
+    "will suffer.\n"
     "\n"
     "options:\n"
     "  --model FILE            decoder model manifest (default: the shipped en-us one)\n"
+    "  --grammar FILE.gram     JSGF grammar in place of the model's language model: only\n"
+    "                          what it allows is recognised\n"
     "  --vad-models DIR        VAD model folder (default: the shipped one)\n"
     "  --no-vad                feed all sound to the decoder\n"
     "  --punct                 punctuate final texts with the shipped English model\n"
     "  --punct-settings FILE   punctuation settings (JSON object of local_punc_settings)\n"
     "  --lang CODE             language code (default en-US)\n"
-    "  --json                  print every result message as JSON\n"
+    "  --json                  print every result message as one JSON object per line,\n"
+    "                          its input named in the field \"input\"\n"
     "  --chunk-ms N            milliseconds of sound per call (default 100)\n"
     "  --max-silence-before-ms N, --max-silence-after-ms N\n"
     "                          end listening after this much silence (VAD on; 0: never)\n"
@@ -63,6 +68,7 @@ constexpr char kUsage[] =
 
 enum Option {
   kModel = 256,
+  kGrammar,
   kVadModels,
   kNoVad,
   kPunct,
@@ -140,6 +146,7 @@ FILE* TakeStdoutForResults(bool verbose) {
 int Transcribe(int argc, char** argv) {
   static const struct option kOptions[] = {
       {"model", required_argument, nullptr, kModel},
+      {"grammar", required_argument, nullptr, kGrammar},
       {"vad-models", required_argument, nullptr, kVadModels},
       {"no-vad", no_argument, nullptr, kNoVad},
       {"punct", no_argument, nullptr, kPunct},
@@ -159,6 +166,7 @@ int Transcribe(int argc, char** argv) {
     long n = 0;
     switch (c) {
       case kModel: o.decoder_model = optarg; break;
+      case kGrammar: o.grammar = optarg; break;
       case kVadModels: o.vad_dir = optarg; break;
       case kNoVad: o.vad = false; break;
       case kPunct: o.punct = true; break;
@@ -238,8 +246,8 @@ int main(int argc, char** argv) {
   if (command == "transcribe") return Transcribe(argc - 1, argv + 1);
   if (command == "vad") return Vad(argc - 1, argv + 1);
   if (command == "pitch") return Pitch(argc - 1, argv + 1);
-  if (command == "version") {
-    std::printf("kvasr %s\n", vorta_speech_get_offline_asr_version());
+  if (command == "--version" || command == "version") {
+    std::printf("kvasr %s\ndecoder: %s\n", KVASR_VERSION, vorta_speech_get_offline_asr_version());
     return 0;
   }
   if (command == "-h" || command == "--help" || command == "help") {

@@ -1,8 +1,12 @@
 #include "transcribe.h"
 
+#include <stdlib.h>
 #include <unistd.h>
 
+#include <cerrno>
+#include <cstring>
 #include <exception>
+#include <filesystem>
 #include <fstream>
 #include <memory>
 #include <sstream>
@@ -30,22 +34,27 @@ const char* const kPunctPathKeys[] = {"model_path", "vocab_path", "punc_path", "
 struct Listener {
   FILE* out = nullptr;
   bool json = false;
+  std::string input;
   std::string prefix;  // "FILE\t" when several inputs share the output
   bool timed_out = false;
 };
 
 void OnResult(void* /*engine*/, const char* result_json, void* context) {
   auto* listener = static_cast<Listener*>(context);
-  if (listener->json) {
-    std::fprintf(listener->out, "%s%s\n", listener->prefix.c_str(), result_json);
-  }
   try {
-    const value message = value::parse(result_json);
+    value message = value::parse(result_json);
     if (message.at(U("status")).as_integer() == kTimeoutStatus) listener->timed_out = true;
-    const value& result = message.at(U("result"));
-    const std::string text = result.at(U("text")).as_string();
-    if (!listener->json && result.at(U("isBreak")).as_bool() && !text.empty()) {
-      std::fprintf(listener->out, "%s%s\n", listener->prefix.c_str(), text.c_str());
+    if (listener->json) {
+      // One object per line, naming its input, so that a line reader needs
+      // nothing else to tell the inputs apart.
+      message[U("input")] = value::string(listener->input);
+      std::fprintf(listener->out, "%s\n", message.serialize().c_str());
+    } else {
+      const value& result = message.at(U("result"));
+      const std::string text = result.at(U("text")).as_string();
+      if (result.at(U("isBreak")).as_bool() && !text.empty()) {
+        std::fprintf(listener->out, "%s%s\n", listener->prefix.c_str(), text.c_str());
+      }
     }
   } catch (const std::exception& e) {
     std::fprintf(stderr, "kvasr: unreadable result message: %s\n", e.what());
@@ -95,6 +104,10 @@ bool ResolveModels(TranscribeOptions* o) {
                  o->decoder_model.c_str());
     return false;
   }
+  if (!o->grammar.empty() && !kvasr_common::IsFile(o->grammar)) {
+    std::fprintf(stderr, "kvasr: grammar '%s' not found\n", o->grammar.c_str());
+    return false;
+  }
   if (o->vad && !kvasr_common::IsDirectory(o->vad_dir)) {
     std::fprintf(stderr, "kvasr: VAD model folder '%s' not found (use --vad-models or --no-vad)\n",
                  o->vad_dir.c_str());
@@ -103,9 +116,48 @@ bool ResolveModels(TranscribeOptions* o) {
   return true;
 }
 
-std::string InitParams(const TranscribeOptions& o, const value* punct_settings) {
+// A manifest that takes everything from another one but the grammar, in a
+// temporary file that goes with this object.
+class GrammarManifest {
+ public:
+  ~GrammarManifest() {
+    if (!path_.empty()) unlink(path_.c_str());
+  }
+
+  bool Write(const std::string& base, const std::string& grammar) {
+    std::string name =
+        (std::filesystem::temp_directory_path() / "kvasr-grammar-XXXXXX.manifest").string();
+    const int fd = mkstemps(name.data(), static_cast<int>(std::strlen(".manifest")));
+    if (fd < 0) {
+      std::fprintf(stderr, "kvasr: no temporary manifest for the grammar: %s\n",
+                   std::strerror(errno));
+      return false;
+    }
+    path_ = name;
+    const std::string text = "kvasr-decoder-manifest 1\nbase = " + Absolute(base) +
+                             "\ngrammar = " + Absolute(grammar) + "\n";
+    const bool written = write(fd, text.data(), text.size()) == static_cast<ssize_t>(text.size());
+    close(fd);
+    if (!written)
+      std::fprintf(stderr, "kvasr: the temporary manifest %s could not be written\n",
+                   path_.c_str());
+    return written;
+  }
+
+  const std::string& path() const { return path_; }
+
+ private:
+  static std::string Absolute(const std::string& path) {
+    return std::filesystem::absolute(path).lexically_normal().string();
+  }
+
+  std::string path_;
+};
+
+std::string InitParams(const TranscribeOptions& o, const std::string& decoder_model,
+                       const value* punct_settings) {
   value params = value::object();
-  params[U("local_moxwing_model_file_path")] = value::string(o.decoder_model);
+  params[U("local_moxwing_model_file_path")] = value::string(decoder_model);
   params[U("local_vad_model_dir_path")] = value::string(o.vad_dir);
   params[U("lang")] = value::string(o.lang);
   params[U("vad_enabled")] = value::boolean(o.vad);
@@ -130,6 +182,12 @@ bool TranscribeOne(void* engine, const std::string& input, const TranscribeOptio
   if (!audio) {
     std::fprintf(stderr, "kvasr: %s: %s\n", input.c_str(), error.c_str());
     return false;
+  }
+  if (audio->rate_hz() < kEngineRateHz) {
+    std::fprintf(stderr,
+                 "kvasr: %s: warning: %d Hz is below %d Hz; the model is wideband and accuracy "
+                 "will suffer\n",
+                 input.c_str(), audio->rate_hz(), kEngineRateHz);
   }
   listener->timed_out = false;
   if (vorta_speech_offline_asr_start(engine, start_params.c_str(), OnResult, listener) != 0) {
@@ -178,14 +236,19 @@ int RunTranscribe(const TranscribeOptions& options, FILE* out) {
   value punct_settings;
   if (o.punct && !LoadPunctSettings(o.punct_settings, &punct_settings)) return 2;
 
+  GrammarManifest grammar_manifest;
+  if (!o.grammar.empty() && !grammar_manifest.Write(o.decoder_model, o.grammar)) return 2;
+  const std::string& decoder_model = o.grammar.empty() ? o.decoder_model : grammar_manifest.path();
+
   void* engine = vorta_speech_create_offline_asr_engine();
   if (vorta_speech_offline_asr_init(
-          engine, InitParams(o, o.punct ? &punct_settings : nullptr).c_str()) != 0) {
+          engine, InitParams(o, decoder_model, o.punct ? &punct_settings : nullptr).c_str()) != 0) {
     std::fprintf(stderr,
-                 "kvasr: the models could not be loaded (decoder model '%s'%s%s); "
+                 "kvasr: the models could not be loaded (decoder model '%s'%s%s%s); "
                  "run with --verbose for the library's log\n",
-                 o.decoder_model.c_str(), o.vad ? ", VAD models " : "",
-                 o.vad ? ("'" + o.vad_dir + "'").c_str() : "");
+                 o.decoder_model.c_str(),
+                 o.grammar.empty() ? "" : (", grammar '" + o.grammar + "'").c_str(),
+                 o.vad ? ", VAD models " : "", o.vad ? ("'" + o.vad_dir + "'").c_str() : "");
     vorta_speech_release_offline_asr_engine(engine);
     return 2;
   }
@@ -195,6 +258,7 @@ int RunTranscribe(const TranscribeOptions& options, FILE* out) {
   listener.json = o.json;
   int failures = 0;
   for (const std::string& input : o.inputs) {
+    listener.input = input;
     listener.prefix = o.inputs.size() > 1 ? input + "\t" : "";
     if (!TranscribeOne(engine, input, o, start_params, &listener)) ++failures;
   }

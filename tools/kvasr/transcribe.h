@@ -14,6 +14,7 @@ struct TranscribeOptions {
   std::string decoder_model;   // empty: the default manifest
   std::string vad_dir;         // empty: the default VAD model folder
   std::string punct_settings;  // empty: the default settings when punct is set
+  std::string grammar;         // JSGF file in place of the model's language model
   std::string lang = "en-US";
   bool vad = true;
   bool punct = false;

@@ -3,6 +3,7 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <cstring>
 #include <map>
@@ -15,6 +16,9 @@ namespace {
 
 // A manifest is a dozen lines; anything much larger is some other file.
 constexpr size_t kMaxManifestBytes = 64 * 1024;
+
+// Bases of bases are allowed, but a chain this long is a loop.
+constexpr int kMaxBaseDepth = 8;
 
 constexpr char kOptionPrefix[] = "option.";
 
@@ -60,10 +64,13 @@ std::optional<std::string> PathOf(FILE* file) {
   return path;
 }
 
+std::optional<ModelSettings> ReadFrom(FILE* file, const std::optional<std::string>& path,
+                                      int depth);
+
 class Parser {
  public:
-  explicit Parser(std::optional<std::string> manifest_path)
-      : manifest_path_(std::move(manifest_path)) {
+  Parser(std::optional<std::string> manifest_path, int depth)
+      : manifest_path_(std::move(manifest_path)), depth_(depth) {
     if (manifest_path_) {
       manifest_dir_ = manifest_path_->substr(0, manifest_path_->rfind('/') + 1);
     }
@@ -153,8 +160,13 @@ class Parser {
       settings_.options.emplace_back(name, value);
       return true;
     }
-    static const char* const kKnownKeys[] = {"acoustic_model", "dictionary", "filler_dictionary",
-                                             "language_model", "grammar",    "log"};
+    static const char* const kKnownKeys[] = {"acoustic_model",
+                                             "dictionary",
+                                             "filler_dictionary",
+                                             "language_model",
+                                             "grammar",
+                                             "log",
+                                             "base"};
     for (const char* known : kKnownKeys) {
       if (key == known) return true;
     }
@@ -192,15 +204,32 @@ class Parser {
   }
 
   std::optional<ModelSettings> Complete() {
-    for (const char* required : {"acoustic_model", "dictionary"}) {
-      if (entries_.count(required) == 0) {
-        return Fail(0, std::string("missing key \"") + required + "\"");
+    const bool has_base = entries_.count("base") > 0;
+    if (!has_base) {
+      for (const char* required : {"acoustic_model", "dictionary"}) {
+        if (entries_.count(required) == 0) {
+          return Fail(0, std::string("missing key \"") + required + "\"");
+        }
       }
     }
-    if (entries_.count("language_model") + entries_.count("grammar") != 1) {
+    const size_t models = entries_.count("language_model") + entries_.count("grammar");
+    if (models > 1 || (models == 0 && !has_base)) {
       return Fail(0, "exactly one of \"language_model\" and \"grammar\" is needed");
     }
-    if (!Resolve("acoustic_model", &settings_.acoustic_model_dir) || !CheckAcousticModel() ||
+    std::vector<std::pair<std::string, std::string>> own_options = std::move(settings_.options);
+    settings_ = ModelSettings();
+    if (has_base) {
+      std::optional<ModelSettings> base = ReadBase();
+      if (!base) return std::nullopt;
+      settings_ = *std::move(base);
+    }
+    // What this manifest names replaces what its base names.
+    if (models == 1) {
+      settings_.language_model.clear();
+      settings_.grammar.clear();
+    }
+    if ((entries_.count("acoustic_model") > 0 &&
+         (!Resolve("acoustic_model", &settings_.acoustic_model_dir) || !CheckAcousticModel())) ||
         !ResolveFile("dictionary", &settings_.dictionary) ||
         !ResolveFile("filler_dictionary", &settings_.filler_dictionary) ||
         !ResolveFile("language_model", &settings_.language_model) ||
@@ -214,7 +243,31 @@ class Parser {
       }
       settings_.log_to_stderr = log->second.value == "stderr";
     }
+    for (auto& [name, value] : own_options) {
+      auto& options = settings_.options;
+      options.erase(std::remove_if(options.begin(), options.end(),
+                                   [&name](const auto& option) { return option.first == name; }),
+                    options.end());
+      options.emplace_back(std::move(name), std::move(value));
+    }
     return settings_;
+  }
+
+  // The settings of the manifest named by "base", whose own paths are taken
+  // from its own folder. Its faults are reported by its own parser.
+  std::optional<ModelSettings> ReadBase() const {
+    std::string path;
+    if (!ResolveFile("base", &path)) return std::nullopt;
+    const int line = entries_.at("base").line;
+    if (depth_ >= kMaxBaseDepth) {
+      return Fail(line, "bases nested more than " + std::to_string(kMaxBaseDepth) +
+                            " deep (does a manifest name itself?)");
+    }
+    FILE* file = fopen(path.c_str(), "rb");
+    if (file == nullptr) return Fail(line, "base \"" + path + "\": " + strerror(errno));
+    std::optional<ModelSettings> base = ReadFrom(file, path, depth_ + 1);
+    fclose(file);
+    return base;
   }
 
   bool CheckAcousticModel() const {
@@ -245,23 +298,14 @@ class Parser {
   };
 
   const std::optional<std::string> manifest_path_;
+  const int depth_;           // 0 for the manifest given, 1 for its base, ...
   std::string manifest_dir_;  // with its trailing slash
   std::map<std::string, Entry> entries_;
   ModelSettings settings_;
 };
 
-}  // namespace
-
-void ReportError(const std::string& message) {
-  fprintf(stderr, "kvasr_decoder: %s\n", message.c_str());
-}
-
-std::optional<ModelSettings> ReadManifest(FILE* file) {
-  if (file == nullptr) {
-    ReportError("no model manifest file given");
-    return std::nullopt;
-  }
-  const std::optional<std::string> path = PathOf(file);
+std::optional<ModelSettings> ReadFrom(FILE* file, const std::optional<std::string>& path,
+                                      int depth) {
   std::string text;
   char chunk[4096];
   size_t got;
@@ -278,7 +322,21 @@ std::optional<ModelSettings> ReadManifest(FILE* file) {
                 ": read failed: " + strerror(errno));
     return std::nullopt;
   }
-  return Parser(path).Parse(text);
+  return Parser(path, depth).Parse(text);
+}
+
+}  // namespace
+
+void ReportError(const std::string& message) {
+  fprintf(stderr, "kvasr_decoder: %s\n", message.c_str());
+}
+
+std::optional<ModelSettings> ReadManifest(FILE* file) {
+  if (file == nullptr) {
+    ReportError("no model manifest file given");
+    return std::nullopt;
+  }
+  return ReadFrom(file, PathOf(file), 0);
 }
 
 }  // namespace kvasr::decoder

@@ -2,9 +2,16 @@
 
 #include <err.h>
 #include <pocketsphinx.h>
+#include <sphinxbase/ckd_alloc.h>
+#include <sphinxbase/fsg_model.h>
+#include <sphinxbase/jsgf.h>
 
 #include <algorithm>
+#include <cctype>
+#include <cstring>
+#include <fstream>
 #include <mutex>
+#include <sstream>
 #include <vector>
 
 #include "kvasr_decoder_constants.h"
@@ -54,6 +61,99 @@ class CallbackScope {
   int* const depth_;
 };
 
+// The search that a grammar from the manifest becomes.
+constexpr char kGrammarSearch[] = "grammar";
+
+// Line (from 1) where `word` first stands as a word of a rule's expansion in
+// the JSGF text, or 0. Rule names <...>, tags {...}, weights /.../ and
+// comments are not words; quotes make one word of what they hold.
+int LineOfWord(const std::string& text, const std::string& word) {
+  int line = 1;
+  bool in_expansion = false;  // between a rule's '=' and its ';'
+  const auto skip_to = [&](size_t* i, const char* end) {
+    const size_t stop = text.find(end, *i);
+    const size_t until = stop == std::string::npos ? text.size() : stop + strlen(end);
+    line += static_cast<int>(std::count(text.begin() + *i, text.begin() + until, '\n'));
+    *i = until;
+  };
+  for (size_t i = 0; i < text.size();) {
+    const char c = text[i];
+    if (text.compare(i, 2, "//") == 0) {
+      skip_to(&i, "\n");
+    } else if (text.compare(i, 2, "/*") == 0) {
+      skip_to(&i, "*/");
+    } else if (c == '<') {
+      skip_to(&i, ">");
+    } else if (c == '{') {
+      skip_to(&i, "}");
+    } else if (c == '/' && in_expansion) {
+      ++i;
+      skip_to(&i, "/");
+    } else if (c == '=' || c == ';') {
+      in_expansion = c == '=';
+      ++i;
+    } else if (c == '"') {
+      const size_t close = text.find('"', i + 1);
+      const size_t end = close == std::string::npos ? text.size() : close;
+      if (in_expansion && text.compare(i + 1, end - i - 1, word) == 0) return line;
+      ++i;
+      skip_to(&i, "\"");
+    } else if (std::isspace(static_cast<unsigned char>(c)) || std::strchr("|*+()[]", c)) {
+      if (c == '\n') ++line;
+      ++i;
+    } else {
+      const size_t end = text.find_first_of(" \t\r\n;=|*+()[]<>{}/\"", i);
+      const size_t stop = end == std::string::npos ? text.size() : end;
+      if (in_expansion && text.compare(i, stop - i, word) == 0) return line;
+      i = stop;
+    }
+  }
+  return 0;
+}
+
+// Turns the JSGF file into the recogniser's search, after checking that the
+// dictionary knows every word: PocketSphinx alone would refuse the grammar
+// naming neither the word nor where it is.
+bool UseGrammar(ps_decoder_t* ps, const std::string& path) {
+  jsgf_t* grammar = jsgf_parse_file(path.c_str(), nullptr);
+  if (grammar == nullptr) {
+    ReportError("grammar \"" + path +
+                "\" is not valid JSGF (\"log = stderr\" in the manifest shows where)");
+    return false;
+  }
+  jsgf_rule_t* rule = jsgf_get_public_rule(grammar);
+  if (rule == nullptr) {
+    ReportError("grammar \"" + path + "\" has no public rule");
+    jsgf_grammar_free(grammar);
+    return false;
+  }
+  fsg_model_t* fsg =
+      jsgf_build_fsg(grammar, rule, ps_get_logmath(ps), cmd_ln_float32_r(ps_get_config(ps), "-lw"));
+  jsgf_grammar_free(grammar);
+  for (int id = 0; id < fsg_model_n_word(fsg); ++id) {
+    const std::string word = fsg_model_word_str(fsg, id);
+    char* pronunciation = ps_lookup_word(ps, word.c_str());
+    if (pronunciation != nullptr) {
+      ckd_free(pronunciation);
+      continue;
+    }
+    std::ifstream in(path);
+    std::stringstream text;
+    text << in.rdbuf();
+    const int line = LineOfWord(text.str(), word);
+    ReportError("grammar \"" + path + "\"" + (line > 0 ? " line " + std::to_string(line) : "") +
+                ": word \"" + word + "\" is not in the dictionary");
+    fsg_model_free(fsg);
+    return false;
+  }
+  // The search keeps its own reference to the model.
+  const bool used =
+      ps_set_fsg(ps, kGrammarSearch, fsg) == 0 && ps_set_search(ps, kGrammarSearch) == 0;
+  fsg_model_free(fsg);
+  if (!used) ReportError("the recogniser could not use grammar \"" + path + "\"");
+  return used;
+}
+
 }  // namespace
 
 std::unique_ptr<Recognizer> Recognizer::Create(const ModelSettings& settings) {
@@ -63,10 +163,9 @@ std::unique_ptr<Recognizer> Recognizer::Create(const ModelSettings& settings) {
   if (!settings.filler_dictionary.empty()) {
     args.insert(args.end(), {"-fdict", settings.filler_dictionary});
   }
+  // A grammar is set up once the dictionary is loaded, to check its words.
   if (!settings.language_model.empty()) {
     args.insert(args.end(), {"-lm", settings.language_model});
-  } else {
-    args.insert(args.end(), {"-jsgf", settings.grammar});
   }
   for (const auto& [name, value] : settings.options) {
     if (!IsKnownOption(name)) {
@@ -93,6 +192,10 @@ std::unique_ptr<Recognizer> Recognizer::Create(const ModelSettings& settings) {
     ReportError(
         "the recogniser could not load the model named in the manifest "
         "(\"log = stderr\" in the manifest shows why)");
+    return nullptr;
+  }
+  if (!settings.grammar.empty() && !UseGrammar(ps, settings.grammar)) {
+    ps_free(ps);
     return nullptr;
   }
   cmd_ln_t* used = ps_get_config(ps);
