@@ -37,17 +37,15 @@ install(FILES ${PROJECT_BINARY_DIR}/kvasr.pc DESTINATION ${CMAKE_INSTALL_LIBDIR}
 
 # The Python module goes where Debian's python3 looks, with a _paths.py that
 # tells it where the library and the models are.
-if(EXISTS ${PROJECT_SOURCE_DIR}/python/kvasr)
-  set(KVASR_INSTALL_PYTHONDIR lib/python3/dist-packages CACHE STRING
-    "Where the Python module is installed, relative to the prefix")
-  install(DIRECTORY ${PROJECT_SOURCE_DIR}/python/kvasr DESTINATION ${KVASR_INSTALL_PYTHONDIR}
-    COMPONENT runtime PATTERN __pycache__ EXCLUDE PATTERN _paths.py EXCLUDE)
-  set(python_dir ${CMAKE_INSTALL_PREFIX}/${KVASR_INSTALL_PYTHONDIR}/kvasr)
-  file(RELATIVE_PATH KVASR_PYTHONDIR_TO_LIBRARY ${python_dir}
-    ${CMAKE_INSTALL_FULL_LIBDIR}/libkvasr_offline)
-  file(RELATIVE_PATH KVASR_PYTHONDIR_TO_MODELSDIR ${python_dir}
-    ${CMAKE_INSTALL_PREFIX}/${KVASR_INSTALL_MODELSDIR})
-  configure_file(${CMAKE_CURRENT_LIST_DIR}/python_paths.py.in ${PROJECT_BINARY_DIR}/_paths.py @ONLY)
-  install(FILES ${PROJECT_BINARY_DIR}/_paths.py DESTINATION ${KVASR_INSTALL_PYTHONDIR}/kvasr
-    COMPONENT runtime)
-endif()
+set(KVASR_INSTALL_PYTHONDIR lib/python3/dist-packages CACHE STRING
+  "Where the Python module is installed, relative to the prefix")
+install(DIRECTORY ${PROJECT_SOURCE_DIR}/python/kvasr DESTINATION ${KVASR_INSTALL_PYTHONDIR}
+  COMPONENT runtime PATTERN __pycache__ EXCLUDE PATTERN _paths.py EXCLUDE)
+set(python_dir ${CMAKE_INSTALL_PREFIX}/${KVASR_INSTALL_PYTHONDIR}/kvasr)
+file(RELATIVE_PATH KVASR_PYTHONDIR_TO_LIBRARY ${python_dir}
+  ${CMAKE_INSTALL_FULL_LIBDIR}/libkvasr_offline)
+file(RELATIVE_PATH KVASR_PYTHONDIR_TO_MODELSDIR ${python_dir}
+  ${CMAKE_INSTALL_PREFIX}/${KVASR_INSTALL_MODELSDIR})
+configure_file(${CMAKE_CURRENT_LIST_DIR}/python_paths.py.in ${PROJECT_BINARY_DIR}/_paths.py @ONLY)
+install(FILES ${PROJECT_BINARY_DIR}/_paths.py DESTINATION ${KVASR_INSTALL_PYTHONDIR}/kvasr
+  COMPONENT runtime)

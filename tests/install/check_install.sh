@@ -1,10 +1,12 @@
 #!/usr/bin/env bash
 # kvasr the way a user gets it, each time transcribing a LibriVox clip:
-#  - installed into a prefix that is then moved: the tool, and the examples
+#  - installed into a prefix that is then moved: the tool, the examples
 #    built against it once through find_package(kvasr), once through
-#    pkg-config;
-#  - as the Debian packages cpack makes: their contents and dependencies,
-#    and, unpacked into a temporary root, the tool and a find_package host.
+#    pkg-config, and the Python module;
+#  - as the Debian packages cpack makes: their contents and dependencies;
+#    unpacked into a temporary root, the tool, a find_package host and the
+#    Python module; installed by apt-get, where a private mount namespace
+#    allows, the same three.
 #
 #   tests/install/check_install.sh BUILD_DIR PACKAGE_BUILD_DIR
 #
@@ -107,9 +109,7 @@ LD_LIBRARY_PATH=$prefix/$libdir "$work/pc-minimal" "$work/clip.raw" >"$work/out"
 expect_words "pkg-config host, minimal" "$(final_texts "$work/out")"
 LD_LIBRARY_PATH=$prefix/$libdir "$work/pc-streaming" <"$work/clip.raw" >"$work/out" 2>/dev/null
 expect_words "pkg-config host, streaming" "$(final_texts "$work/out")"
-if [ -d python/kvasr ]; then
-  python_transcribes "installed Python module" "$prefix/$(cache_value "$build" KVASR_INSTALL_PYTHONDIR)"
-fi
+python_transcribes "installed Python module" "$prefix/$(cache_value "$build" KVASR_INSTALL_PYTHONDIR)"
 
 echo "== Debian packages"
 cmake -S . -B "$package_build" -DCMAKE_BUILD_TYPE=RelWithDebInfo -DCMAKE_INSTALL_PREFIX=/usr \
@@ -143,7 +143,7 @@ expect_in "$runtime_deb" /usr/bin/kvasr "/usr/$libdir/libkvasr_offline" \
   "/usr/$libdir/libkvasr_offline.so" "/usr/$libdir/libkvasr_decoder.so.0" \
   "/usr/$libdir/libkvasr_punctuator.so.0" /usr/share/kvasr/models/decoder/en-us.manifest \
   /usr/share/kvasr/models/vad/quellan_data_b /usr/share/kvasr/models/punct/en/model.bin \
-  /usr/share/kvasr/models/punct/en/settings.json
+  /usr/share/kvasr/models/punct/en/settings.json /usr/lib/python3/dist-packages/kvasr/_paths.py
 expect_not_in "$runtime_deb" /usr/include
 expect_not_in "$runtime_deb" /cmake/
 expect_in "$dev_deb" /usr/include/kvasr_offline.h /usr/include/kvasr_decoder_api.h \
@@ -169,7 +169,37 @@ cmake --build "$work/package-host" -j"$jobs" --target minimal >/dev/null
 env -u LD_LIBRARY_PATH "$work/package-host/minimal" "$work/clip.raw" >"$work/out"
 expect_words "find_package host of the unpacked packages" "$(final_texts "$work/out")"
 
-if [ -d python/kvasr ]; then
-  expect_in "$runtime_deb" /usr/lib/python3/dist-packages/kvasr/_paths.py
-  python_transcribes "packaged Python module, unpacked" "$root/usr/lib/python3/dist-packages"
+python_transcribes "packaged Python module, unpacked" "$root/usr/lib/python3/dist-packages"
+
+# apt-get itself, where a private mount namespace can lay throwaway overlays
+# over /usr, /etc and /var: the installation is seen by this check only.
+echo "== the packages installed by apt-get"
+overlay=$work/overlay
+mkdir -p "$overlay/probe/lower" "$overlay/probe/upper" "$overlay/probe/work" "$overlay/probe/mnt"
+if [ "$(id -u)" -ne 0 ] || ! unshare -m mount -t overlay overlay -o "lowerdir=$overlay/probe/lower,\
+upperdir=$overlay/probe/upper,workdir=$overlay/probe/work" "$overlay/probe/mnt" 2>/dev/null; then
+  echo "skipped: needs root and overlay mounts in a private mount namespace"
+  exit 0
 fi
+cp "$runtime_deb" "$dev_deb" "$overlay/"
+unshare -m bash -s -- "$overlay" "$clip" "$work" "$PWD/examples" <<'SH' || fail "the apt-get install check failed (logs in $work)"
+set -euo pipefail
+overlay=$1 clip=$2 work=$3 examples=$4
+for d in usr etc var; do
+  mkdir -p "$overlay/$d/upper" "$overlay/$d/work"
+  mount -t overlay overlay -o "lowerdir=/$d,upperdir=$overlay/$d/upper,workdir=$overlay/$d/work" "/$d"
+done
+cd "$overlay"
+DEBIAN_FRONTEND=noninteractive apt-get install -y -q --no-install-recommends \
+  ./kvasr_*.deb ./kvasr-dev_*.deb >"$work/apt.log" 2>&1
+cd /
+env -u LD_LIBRARY_PATH /usr/bin/kvasr transcribe "$clip" >"$work/apt-tool.out" 2>/dev/null
+cmake -S "$examples" -B "$work/apt-host" >/dev/null
+cmake --build "$work/apt-host" --target minimal >/dev/null
+env -u LD_LIBRARY_PATH "$work/apt-host/minimal" "$work/clip.raw" >"$work/apt-host.out"
+env -u PYTHONPATH -u KVASR_LIBRARY /usr/bin/python3 -m kvasr "$clip" >"$work/apt-python.out"
+SH
+expect_words "apt-get installed tool" "$(cat "$work/apt-tool.out")"
+expect_words "find_package host of the apt-get installed packages" \
+  "$(final_texts "$work/apt-host.out")"
+expect_words "apt-get installed Python module" "$(cat "$work/apt-python.out")"
