@@ -15,17 +15,28 @@ install(FILES
   ${PROJECT_SOURCE_DIR}/include/kvasr_punctuator_api.h
   DESTINATION ${CMAKE_INSTALL_INCLUDEDIR} COMPONENT dev)
 
-install(EXPORT kvasrTargets NAMESPACE kvasr:: DESTINATION ${KVASR_INSTALL_CMAKEDIR}
-  COMPONENT dev)
-configure_package_config_file(${CMAKE_CURRENT_LIST_DIR}/kvasrConfig.cmake.in
-  ${PROJECT_BINARY_DIR}/kvasrConfig.cmake
-  INSTALL_DESTINATION ${KVASR_INSTALL_CMAKEDIR}
-  PATH_VARS KVASR_INSTALL_MODELSDIR)
-# Before 1.0 a minor version may change the interface.
-write_basic_package_version_file(${PROJECT_BINARY_DIR}/kvasrConfigVersion.cmake
-  COMPATIBILITY SameMinorVersion)
-install(FILES ${PROJECT_BINARY_DIR}/kvasrConfig.cmake ${PROJECT_BINARY_DIR}/kvasrConfigVersion.cmake
-  DESTINATION ${KVASR_INSTALL_CMAKEDIR} COMPONENT dev)
+# The CMake package describes libkvasr_offline with the libraries it links;
+# a build that puts other targets behind it (the sanitizer and fuzzing builds
+# link the test doubles) has none to install.
+set(package_exportable ON)
+foreach(provider ${KVASR_DECODER_LIBRARY} ${KVASR_PUNCTUATOR_LIBRARY})
+  if(TARGET ${provider} AND NOT provider MATCHES "^kvasr_(decoder|punctuator)$")
+    set(package_exportable OFF)
+  endif()
+endforeach()
+if(package_exportable)
+  install(EXPORT kvasrTargets NAMESPACE kvasr:: DESTINATION ${KVASR_INSTALL_CMAKEDIR}
+    COMPONENT dev)
+  configure_package_config_file(${CMAKE_CURRENT_LIST_DIR}/kvasrConfig.cmake.in
+    ${PROJECT_BINARY_DIR}/kvasrConfig.cmake
+    INSTALL_DESTINATION ${KVASR_INSTALL_CMAKEDIR}
+    PATH_VARS KVASR_INSTALL_MODELSDIR)
+  # Before 1.0 a minor version may change the interface.
+  write_basic_package_version_file(${PROJECT_BINARY_DIR}/kvasrConfigVersion.cmake
+    COMPATIBILITY SameMinorVersion)
+  install(FILES ${PROJECT_BINARY_DIR}/kvasrConfig.cmake ${PROJECT_BINARY_DIR}/kvasrConfigVersion.cmake
+    DESTINATION ${KVASR_INSTALL_CMAKEDIR} COMPONENT dev)
+endif()
 
 # The .pc file locates the prefix from its own folder, so a moved prefix works.
 file(RELATIVE_PATH KVASR_PKGCONFIG_TO_PREFIX ${CMAKE_INSTALL_FULL_LIBDIR}/pkgconfig
