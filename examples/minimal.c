@@ -1,13 +1,19 @@
 /*
  * Smallest complete use of the library: one listening period over a raw
- * 16 kHz 16-bit mono file, printing every result message.
+ * 16 kHz 16-bit mono file with the default models, printing every result
+ * message. KVASR_MODELS_DIR comes from the build: the CMake package's
+ * variable of that name or `pkg-config --variable=modelsdir kvasr`.
  *
- *   minimal DECODER_MODEL VAD_MODEL_DIR AUDIO.raw
+ *   minimal AUDIO.raw
  */
 #include <stdio.h>
 #include <stdlib.h>
 
 #include "kvasr_offline.h"
+
+#ifndef KVASR_MODELS_DIR
+#define KVASR_MODELS_DIR "/usr/share/kvasr/models"
+#endif
 
 static void on_result(void* engine, const char* result_json, void* context) {
   (void)engine;
@@ -16,22 +22,22 @@ static void on_result(void* engine, const char* result_json, void* context) {
 }
 
 int main(int argc, char** argv) {
-  if (argc != 4) {
-    fprintf(stderr, "usage: %s DECODER_MODEL VAD_MODEL_DIR AUDIO.raw\n", argv[0]);
+  if (argc != 2) {
+    fprintf(stderr, "usage: %s AUDIO.raw\n", argv[0]);
     return 2;
   }
-  char params[4096];
-  snprintf(params, sizeof params,
-           "{\"local_moxwing_model_file_path\":\"%s\",\"local_vad_model_dir_path\":\"%s\","
-           "\"lang\":\"en\",\"vad_enabled\":false}",
-           argv[1], argv[2]);
+  const char* params = "{\"local_moxwing_model_file_path\":\"" KVASR_MODELS_DIR
+                       "/decoder/en-us.manifest\","
+                       "\"local_vad_model_dir_path\":\"" KVASR_MODELS_DIR
+                       "/vad\","
+                       "\"lang\":\"en-US\",\"vad_enabled\":true}";
 
   void* engine = vorta_speech_create_offline_asr_engine();
   int status = 1;
   FILE* audio = NULL;
   if (vorta_speech_offline_asr_init(engine, params) != 0) goto done;
   if (vorta_speech_offline_asr_start(engine, "{\"asr\":{}}", on_result, NULL) != 0) goto done;
-  audio = fopen(argv[3], "rb");
+  audio = fopen(argv[1], "rb");
   if (!audio) goto done;
 
   int16_t chunk[1600]; /* 100 ms */

@@ -1,13 +1,14 @@
 #!/usr/bin/env bash
-# The main job on a fresh Debian machine: installs what is needed, builds
-# kvasr, and transcribes real recordings (LibriVox clips that Debian's
+# The main job on a fresh Debian machine: installs what building and
+# running needs (no test or training packages), builds kvasr, and
+# transcribes real recordings (LibriVox clips that Debian's
 # pocketsphinx-testdata ships) with the default models: the voice activity
 # detector lets only speech through to the decoder.
 set -euo pipefail
 cd "$(dirname "$0")/.."
 
-bash scripts/setup-deps.sh
-cmake -S . -B build -DCMAKE_BUILD_TYPE=RelWithDebInfo >/dev/null
+bash scripts/setup-deps.sh run
+cmake -S . -B build -DCMAKE_BUILD_TYPE=RelWithDebInfo -DKVASR_BUILD_TESTS=OFF >/dev/null
 cmake --build build -j"$(nproc)" --target kvasr >/dev/null
 
 clips=(/usr/share/pocketsphinx/test/data/librivox/*.wav)

@@ -1,13 +1,13 @@
 #!/usr/bin/env bash
 # Sets up the machine and runs every check: the formatting of every tracked
-# C and C++ file, the test suite in a plain build
-# (warnings as errors), each fuzz target for a bounded time, the four-engine
-# test under ThreadSanitizer, and the test suite again under
-# AddressSanitizer + UndefinedBehaviorSanitizer.
+# C and C++ file, the test suite in a plain build (warnings as errors), the
+# installed prefix and the Debian packages as a user gets them, each fuzz
+# target for a bounded time, the four-engine test under ThreadSanitizer, and
+# the test suite again under AddressSanitizer + UndefinedBehaviorSanitizer.
 set -euo pipefail
 cd "$(dirname "$0")/.."
 
-bash scripts/setup-deps.sh
+bash scripts/setup-deps.sh test
 
 jobs=$(nproc)
 
@@ -15,9 +15,12 @@ echo "== formatting (.clang-format)"
 git ls-files -z '*.c' '*.cc' '*.cpp' '*.h' '*.hpp' | xargs -0 clang-format --dry-run --Werror
 
 echo "== plain build"
-cmake -S . -B build -DCMAKE_BUILD_TYPE=RelWithDebInfo -DKVASR_WERROR=ON
+cmake -S . -B build -DCMAKE_BUILD_TYPE=RelWithDebInfo -DKVASR_WERROR=ON -DKVASR_BUILD_TESTS=ON
 cmake --build build -j"$jobs"
 ctest --test-dir build --output-on-failure -j"$jobs"
+
+echo "== installed prefix and Debian packages, each transcribing a clip"
+bash tests/install/check_install.sh build build-deb
 
 echo "== fuzzing (libFuzzer, ASan + UBSan), ${FUZZ_SECONDS:=50} s per target"
 FUZZ_SECONDS=$FUZZ_SECONDS bash fuzz/run.sh

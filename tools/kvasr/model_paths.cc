@@ -19,8 +19,8 @@ std::string ExecutableDir() {
 }  // namespace
 
 std::string DefaultModelsDir() {
-  // Installed: <prefix>/bin/kvasr with models in <prefix>/share/kvasr/models.
-  const std::string installed = ExecutableDir() + "/../" KVASR_INSTALL_DATA_RELDIR "/models";
+  // Installed: found from the executable, so a moved or unpacked prefix works.
+  const std::string installed = ExecutableDir() + "/" KVASR_MODELS_FROM_BINDIR;
   if (kvasr_common::IsDirectory(installed + "/decoder")) return installed;
   // Build tree: the source checkout's models folder.
   const std::string source = KVASR_SOURCE_MODELS_DIR;

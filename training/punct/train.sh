@@ -5,8 +5,8 @@
 # (DATA_DIR defaults to ../shared/data/punct beside the checkout, WORK_DIR,
 # which keeps the first run's model, to /tmp/kvasr-punct-train)
 # Needs Debian's python3-torch and python3-numpy, and OpenBLAS as the system
-# BLAS (scripts/setup-deps.sh installs it; with the reference BLAS torch's
-# recurrent layer trains thirteen times slower). Two runs over the 4.7M words:
+# BLAS (scripts/setup-deps.sh train installs them; with the reference BLAS
+# torch's recurrent layer trains thirteen times slower). Two runs over the 4.7M words:
 # the whole network from scratch, ten epochs (about 85 minutes on two
 # cores), then three more epochs at a lower rate (about 30 minutes).
 set -eu

@@ -243,12 +243,13 @@ class Parser {
       }
       settings_.log_to_stderr = log->second.value == "stderr";
     }
-    for (auto& [name, value] : own_options) {
+    for (auto& own : own_options) {
       auto& options = settings_.options;
-      options.erase(std::remove_if(options.begin(), options.end(),
-                                   [&name](const auto& option) { return option.first == name; }),
-                    options.end());
-      options.emplace_back(std::move(name), std::move(value));
+      options.erase(
+          std::remove_if(options.begin(), options.end(),
+                         [&own](const auto& option) { return option.first == own.first; }),
+          options.end());
+      options.push_back(std::move(own));
     }
     return settings_;
   }
