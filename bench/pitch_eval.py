@@ -1,4 +1,5 @@
 #!/usr/bin/python3
+# SPDX-License-Identifier: Apache-2.0
 """Pitch-tracking accuracy and cost against three established trackers.
 
   bench/pitch_eval.py [--kvasr build/tools/kvasr/kvasr] [--noisy]

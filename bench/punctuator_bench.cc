@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Time to punctuate one recognised text, by length, with the shipped model
 // (or the model folder named by KVASR_PUNCT_BENCH_MODEL, to time another
 // shape before training it fully), through the C function the engine calls.

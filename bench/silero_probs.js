@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Per-frame speech probabilities of the Silero VAD (v5 ONNX model of the npm
 // package @ricky0123/vad-web, run with onnxruntime-node), written as
 // <name>.prob (float32 per 10 ms frame) for training/vad/evaluate.py.

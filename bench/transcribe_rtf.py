@@ -1,4 +1,5 @@
 #!/usr/bin/env python3
+# SPDX-License-Identifier: Apache-2.0
 """Real-time factor of `kvasr transcribe` on Debian's LibriVox test clips.
 
 Runs the tool several times per mode and prints the median CPU seconds

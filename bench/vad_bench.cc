@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Cost of the voice activity path on the shipped model: PLP alone, the
 // network alone, and the whole pipeline at several chunk lengths, each as CPU
 // seconds per second of audio (the "rtf" counter); and the resident memory

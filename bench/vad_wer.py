@@ -1,4 +1,5 @@
 #!/usr/bin/python3
+# SPDX-License-Identifier: Apache-2.0
 """Word error rate of `kvasr transcribe` on Debian's LibriVox test clips with
 the VAD on and off, and the peak resident memory of each run.
 

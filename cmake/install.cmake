@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 # What `cmake --install` and cpack put where. Two components: `runtime` (the
 # libraries, the tool, the default models, the Python module) and `dev` (the
 # headers, the CMake package and the pkg-config file).

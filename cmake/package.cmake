@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 # `cpack -G DEB` in the build folder makes two Debian packages from the
 # install components: kvasr (runtime) and kvasr-dev. Configure with
 # -DCMAKE_INSTALL_PREFIX=/usr so that the libraries go to Debian's multiarch

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The one way a hot loop chooses between its vectorised build and its plain
 // one: `if (kvasr_common::HasAvx()) return LoopAvx(...); return Loop(...);`.
 #ifndef KVASR_COMMON_CPU_DISPATCH_H_

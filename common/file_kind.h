@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What a path names, following links: the checks behind "is not a file" and
 // "is not a directory" messages.
 #ifndef KVASR_COMMON_FILE_KIND_H_

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 /*
  * Smallest complete use of the library: one listening period over a raw
  * 16 kHz 16-bit mono file with the default models, printing every result

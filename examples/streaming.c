@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 /*
  * Live transcription from a pipe: 16 kHz 16-bit mono samples arrive on
  * standard input and go to the engine in 100 ms chunks as they come. Final

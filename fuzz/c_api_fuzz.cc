@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The C interface driven by a byte stream that chooses the calls: engines are
 // created, initialised (the voice activity module on or off, with small test
 // models), started, fed chunks of any size and content, stopped, closed and

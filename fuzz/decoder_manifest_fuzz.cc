@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The decoder library's model manifest parser. The first byte chooses how
 // the text arrives: from a file with a path, so that relative entries resolve
 // against a real folder, or from memory, where the path is unknown.

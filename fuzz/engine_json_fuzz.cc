@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The init and start parameter texts, through the engine with the test
 // doubles as back ends. The input is the init text, a zero byte, then the
 // start text; without a zero byte the same text serves as both.

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What the fuzz targets share: a private scratch folder and whole-file writes.
 #ifndef KVASR_FUZZ_FUZZ_SUPPORT_H_
 #define KVASR_FUZZ_FUZZ_SUPPORT_H_

@@ -1,4 +1,5 @@
 #!/usr/bin/env python3
+# SPDX-License-Identifier: Apache-2.0
 """Writes the starting corpus of every fuzz target into OUT/<target>/.
 
 Small well-formed inputs (model files like the module's tests write, the

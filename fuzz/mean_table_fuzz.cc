@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The cepstral mean table: any bytes must be taken or refused when the
 // feature extractor is built, and a taken table must normalise audio.
 #include <cstddef>

@@ -1,4 +1,5 @@
 #!/usr/bin/env bash
+# SPDX-License-Identifier: Apache-2.0
 # Builds the fuzz targets (clang, libFuzzer, ASan + UBSan) in build-fuzz and
 # runs each for a bounded time. Exits non-zero on the first finding, whose
 # reproducer is left in build-fuzz/artifacts/<target>/.

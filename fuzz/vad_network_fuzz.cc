@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The detector's network file: any bytes must load into a usable network or
 // be refused with a message, and a loaded network must score a batch.
 #include <cstddef>

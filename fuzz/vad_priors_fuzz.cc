@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The detector's class-prior file, read against a fixed small network; the
 // network then scores a batch with whatever priors were accepted.
 #include <cstddef>

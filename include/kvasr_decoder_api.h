@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 /*
  * Decoder library interface: the functions the engine's decoder adapter calls.
  * Any shared library that defines these symbols can serve as the decoder;

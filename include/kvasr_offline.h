@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 /*
  * kvasr: offline speech recognition, public C interface.
  *

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 /*
  * Punctuation library interface: the functions the engine's punctuation
  * adapter calls. Any shared library that defines these symbols can serve;

@@ -1,4 +1,5 @@
 #!/usr/bin/env bash
+# SPDX-License-Identifier: Apache-2.0
 # The main job on a fresh Debian machine: installs what building and
 # running needs (no test or training packages), builds kvasr, and
 # transcribes real recordings (LibriVox clips that Debian's

@@ -1,4 +1,5 @@
 #!/usr/bin/env bash
+# SPDX-License-Identifier: Apache-2.0
 # Installs the Debian packages kvasr needs for one purpose. Run as root (or
 # with sudo) on Debian 12.
 #

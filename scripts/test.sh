@@ -1,4 +1,5 @@
 #!/usr/bin/env bash
+# SPDX-License-Identifier: Apache-2.0
 # Sets up the machine and runs every check: the formatting of every tracked
 # C and C++ file, the test suite in a plain build (warnings as errors), the
 # installed prefix and the Debian packages as a user gets them, each fuzz

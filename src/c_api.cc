@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The exported C functions: null-checking shims over the engine.
 //
 // No exception may cross into a C caller. The engine reports its own

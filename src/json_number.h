@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Conversions of JSON numbers to fixed-width integers.
 #ifndef KVASR_SRC_JSON_NUMBER_H_
 #define KVASR_SRC_JSON_NUMBER_H_

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Decoder adapter: one instance of the decoder library behind the mw* functions.
 #ifndef KVASR_SRC_MOXWING_H_
 #define KVASR_SRC_MOXWING_H_

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 #include "offline_asr_engine_impl.h"
 
 #include <exception>

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The engine behind each handle of the C interface: lifecycle, parameters,
 // audio path and result messages.
 #ifndef KVASR_SRC_OFFLINE_ASR_ENGINE_IMPL_H_

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Punctuation adapter: one instance of the punctuation library behind the
 // punctuator_* functions.
 #ifndef KVASR_SRC_PUNCTUATOR_H_

@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """Offline speech recognition over libkvasr_offline.
 
     import kvasr

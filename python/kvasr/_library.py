@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """Loading libkvasr_offline, finding the default models, and keeping the
 library's log off the process's standard output."""
 

@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """Sound files as the engine wants them: 16 kHz, mono, 16-bit."""
 
 import array

@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """One recognition engine of libkvasr_offline behind a Python object."""
 
 import ctypes

@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """Shared recordings and paths. The test run names the library under test
 with KVASR_LIBRARY and the command-line tool with KVASR_TOOL."""
 

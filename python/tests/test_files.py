@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """transcribe_file and python3 -m kvasr over recordings of any rate and
 channel count, and over files that are no recordings."""
 

@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """The package as a user gets it: installed by pip, found through the
 installed package's _paths.py, or beside an installed prefix."""
 

@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """The Recognizer against the C library driven by the command-line tool, and
 against bad input, careless callers and long use."""
 

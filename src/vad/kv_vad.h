@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Speech segment buffer: passes audio through the voice activity module and
 // queues the speech it returns as segments for the decoder.
 #ifndef KVASR_SRC_VAD_KV_VAD_H_

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Reading the model manifest through mwDecoderInit: every fault gives a null
 // handle and one explaining line on standard error.
 #include <gtest/gtest.h>

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Streaming through the mw* functions on real speech: result order and
 // count per utterance, restarts, independent instances, speech-end
 // detection, and calls out of order or out of range.

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Helpers shared by the decoder library's tests: recordings, and a decoder
 // session that records every callback.
 #ifndef KVASR_TESTS_DECODER_DECODER_TEST_SUPPORT_H_

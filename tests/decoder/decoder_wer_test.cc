@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Word error rate of the shipped model on the LibriVox recordings of
 // pocketsphinx-testdata, decoded through the mw* functions as the engine
 // would feed them, and the speed of doing so.

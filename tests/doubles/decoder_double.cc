@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 #include "decoder_double.h"
 
 #include <algorithm>

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Scriptable stand-in for the decoder library: records every mw* call and
 // fires the callbacks a test asks for.
 #ifndef KVASR_TESTS_DOUBLES_DECODER_DOUBLE_H_

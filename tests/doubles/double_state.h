@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What every double keeps for the whole process, since the library calls it
 // stands in for carry no test context: the calls made to it in order and the
 // handles it gave out and has not taken back. A double's own state extends

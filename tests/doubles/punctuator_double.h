@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Scriptable stand-in for the punctuation library: records every
 // punctuator_* call; by default it appends "." to the text and honours the
 // buffer size protocol.

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 #include "quellan_double.h"
 
 #include <algorithm>

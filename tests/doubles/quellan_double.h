@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Scriptable stand-in for the voice activity module's entry points.
 #ifndef KVASR_TESTS_DOUBLES_QUELLAN_DOUBLE_H_
 #define KVASR_TESTS_DOUBLES_QUELLAN_DOUBLE_H_

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Real recordings through the public C API with the shipped decoder model.
 #include "kvasr_offline.h"
 

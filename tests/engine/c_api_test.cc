@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The public C functions, linked through libkvasr_offline.so with the test
 // doubles standing in for the platform libraries.
 #include "kvasr_offline.h"

@@ -1,4 +1,5 @@
 #!/usr/bin/env bash
+# SPDX-License-Identifier: Apache-2.0
 # The shared object exports exactly the nine public functions and takes the
 # platform libraries' functions, and nothing else of ours, from outside.
 set -euo pipefail

@@ -1,4 +1,5 @@
 #!/usr/bin/env bash
+# SPDX-License-Identifier: Apache-2.0
 # kvasr the way a user gets it, each time transcribing a LibriVox clip:
 #  - installed into a prefix that is then moved: the tool, the examples
 #    built against it once through find_package(kvasr), once through

@@ -1,4 +1,5 @@
 #!/bin/sh
+# SPDX-License-Identifier: Apache-2.0
 # The library's dynamic symbol table defines the three C functions and
 # nothing else.
 set -eu

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Compares the library's network output with the logits the trainer wrote
 // for the same texts (train.py --forward-check). Exit status 0 when every
 // value agrees within the tolerance. With --baseline the products run the

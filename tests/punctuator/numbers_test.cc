@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Spelled numbers to digits with the shipped rule files.
 #include <gtest/gtest.h>
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The library through its three C functions, with the shipped English model.
 #include <gtest/gtest.h>
 

@@ -1,4 +1,5 @@
 #!/bin/sh
+# SPDX-License-Identifier: Apache-2.0
 # Trains a tiny model through each of the trainer's starting points (from
 # scratch without a recurrent layer, a recurrent layer on top of that
 # encoder, then the whole network carried on as train.sh's second run does),

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The rows the detector sees must not depend on how the caller cuts an
 // utterance: PLP takes over the frames it analysed for the previous chunk
 // instead of analysing them again, and that must give exactly what one call

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Hours-long listening periods must run in fixed memory: twelve minutes
 // between two resets, five times the per-utterance buffers.
 #include <gtest/gtest.h>

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Writers of small detector model files, and the audio and directories the
 // tests share.
 #ifndef KVASR_TESTS_QUELLAN_MODEL_FILES_H_

@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """Independent numpy model of the detector's PLP features and network.
 
 Runs the C++ reference_tool on audio and random networks and compares its

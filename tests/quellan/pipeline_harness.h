@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Feeds audio through the pipeline in chunks and checks what each call
 // emits against the audio it was given.
 #ifndef KVASR_TESTS_QUELLAN_PIPELINE_HARNESS_H_

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 #include "pitch_tracker.h"
 
 #include <gtest/gtest.h>

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Command-line driver that runs the module's feature extractor and network on
 // files, so that an independent numpy implementation can check the results.
 //

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Engines on different threads share nothing: four engines listen at once,
 // each to its own audio, and each must report exactly what it reports alone.
 // Built with ThreadSanitizer by tsan.sh.

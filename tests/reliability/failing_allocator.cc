@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Kept in its own file so that no caller sees (and inlines) the pairing of
 // malloc and free behind new and delete. The nothrow and array forms of the
 // standard library come here too.

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Replaces the global allocation functions of the program so that a test can
 // make one chosen allocation fail.
 #ifndef KVASR_TESTS_RELIABILITY_FAILING_ALLOCATOR_H_

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Allocation failures during init: whichever allocation fails, init either
 // absorbs it or fails cleanly, leaving an uninitialised engine that can be
 // initialised again and released.

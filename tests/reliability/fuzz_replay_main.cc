@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Runs a fuzz target's entry point over the saved inputs of one folder,
 // without libFuzzer, so that every finding stays a test of the normal and
 // sanitizer builds.

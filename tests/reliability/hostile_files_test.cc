@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Broken and hostile voice activity model files, through the engine: each
 // must fail init with the module's reason on standard output, keep the
 // engine uninitialised, and leave it usable once the files are mended.

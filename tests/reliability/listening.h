@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Whole listening periods of the engine with the voice activity module on and
 // the summing decoder behind it, and their audio from the shared corpus.
 #ifndef KVASR_TESTS_RELIABILITY_LISTENING_H_

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // One listening period fed hours of real speech between long pauses, at full
 // speed: memory stays flat, every segment reaches the decoder, and after the
 // final time-out no message follows. The length comes from

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A decoder library that recognises nothing but reports, for every stretch of
 // audio it decoded, how many samples it got and a hash of them. It keeps all
 // state in its handles, so engines on different threads share nothing in it.

@@ -1,4 +1,5 @@
 #!/usr/bin/env bash
+# SPDX-License-Identifier: Apache-2.0
 # Builds the four-thread engine test with ThreadSanitizer (clang) in
 # build-tsan and runs it: four engines, each with the real voice activity
 # module, listen to a minute of audio at once. Fails on any reported race.

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Replaces the global allocation functions of the test program. Kept in its
 // own file so that no caller sees (and inlines) the malloc/free pairing.
 #include "allocation_counter.h"

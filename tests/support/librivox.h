@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The LibriVox recordings of Debian's pocketsphinx-testdata with their
 // reference transcripts, and word error counting.
 #ifndef KVASR_TESTS_SUPPORT_LIBRIVOX_H_

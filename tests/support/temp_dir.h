@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Temporary directories for the tests and fuzz targets. Every one is removed
 // with what it holds: runs of the suite must not pile folders up in /tmp.
 #ifndef KVASR_TESTS_SUPPORT_TEMP_DIR_H_

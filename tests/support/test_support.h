@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Helpers shared by the tests: temporary files, captured standard output.
 #ifndef KVASR_TESTS_SUPPORT_TEST_SUPPORT_H_
 #define KVASR_TESTS_SUPPORT_TEST_SUPPORT_H_

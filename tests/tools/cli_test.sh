@@ -1,4 +1,5 @@
 #!/usr/bin/env bash
+# SPDX-License-Identifier: Apache-2.0
 # The kvasr tool against real recordings and against every kind of bad input:
 # exit status, the one error line, and that the other inputs still go through.
 set -uo pipefail

@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """Checks that the module's network code scores frames as the trainer does.
 
   forward_check.py trained TOOL MODEL_DIR ROWS.f32 TRAINER_SCORES.f32

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Scores feature rows with the module's network code, for comparison with
 // the trainer's own forward pass.
 //

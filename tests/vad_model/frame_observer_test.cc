@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The detector's frame observer: what it reports is what the detector used,
 // and watching changes nothing.
 #include <gtest/gtest.h>

@@ -1,4 +1,5 @@
 #!/bin/bash
+# SPDX-License-Identifier: Apache-2.0
 # A few training steps on a tiny sample of the corpus, through every stage of
 # training/vad/train.sh, ending with the module scoring frames exactly as the
 # trainer does with the network it wrote.

@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """`kvasr vad` on a synthetic recording: the segment list, the per-frame
 listing and the plot describe the same detection.
 

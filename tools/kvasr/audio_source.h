@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Sound for the engine: any file libsndfile reads, from a path or standard
 // input (where a stream without a container header is raw 16 kHz s16le
 // mono), delivered as 16 kHz mono 16-bit chunks.

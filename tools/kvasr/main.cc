@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // kvasr: command-line front end of the offline recogniser.
 #include <fcntl.h>
 #include <getopt.h>

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Where the default models are: next to the build tree, or under the install
 // prefix relative to the executable.
 #ifndef KVASR_TOOLS_KVASR_MODEL_PATHS_H_

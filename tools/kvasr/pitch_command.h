@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // `kvasr pitch`: runs the pitch tracker of the voice activity module on a
 // recording and prints its raw pitch track, one line per 10 ms frame.
 #ifndef KVASR_TOOLS_KVASR_PITCH_COMMAND_H_

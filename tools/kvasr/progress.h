@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A one-line progress bar on standard error.
 #ifndef KVASR_TOOLS_KVASR_PROGRESS_H_
 #define KVASR_TOOLS_KVASR_PROGRESS_H_

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // `kvasr transcribe`: recognise files or standard input through the public API.
 #ifndef KVASR_TOOLS_KVASR_TRANSCRIBE_H_
 #define KVASR_TOOLS_KVASR_TRANSCRIBE_H_

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // `kvasr vad`: runs the voice activity detector on recordings and prints
 // speech segments or per-frame decisions.
 #ifndef KVASR_TOOLS_KVASR_VAD_COMMAND_H_

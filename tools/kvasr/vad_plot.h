@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Draws one recording's waveform, smoothed score, decisions and emitted
 // segments into a PNG with gnuplot.
 #ifndef KVASR_TOOLS_KVASR_VAD_PLOT_H_

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Runs the voice activity pipeline over one recording, chunk by chunk as the
 // engine feeds it, and records what it decided for every 10 ms frame.
 #ifndef KVASR_TOOLS_KVASR_VAD_RUN_H_

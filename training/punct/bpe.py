@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """Byte-level subword merges. Symbols 0-255 are bytes; merge number r makes
 symbol 256 + r. Only ASCII is merged, so a merge never splits a character."""
 

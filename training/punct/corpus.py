@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """Turns cased, punctuated text into what the recogniser gives the punctuator
 (lower-case words, numbers often spelled out, no marks) plus the labels the
 model learns: the mark after each word and each word's casing class."""

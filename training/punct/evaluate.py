@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """Scores the punctuation library, through its C functions, on the IWSLT 2011
 test sets: precision, recall and F1 per mark and overall (micro over COMMA,
 PERIOD, QUESTION, token level), and casing accuracy against the cased

@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """Precision, recall and F1 of predicted marks."""
 
 import numpy as np

@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """Trains the punctuation and casing model and writes the files the
 punctuation library loads (formats: platform/punctuator/README.md)."""
 

@@ -1,4 +1,5 @@
 #!/bin/sh
+# SPDX-License-Identifier: Apache-2.0
 # Rebuilds the English punctuation model in models/punct/en/ and the
 # reference logits the library's forward pass is checked against.
 # Usage: training/punct/train.sh [DATA_DIR [WORK_DIR]]

@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """The VAD corpora: manifests, and the split into train, val and dev.
 
 The shared corpus: speech is split by speaker label, non-speech by file,

@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """The detector's decision stage in numpy, and a loss taken through it.
 
 The detector does not decide on single network scores. It scores every third

@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """Detection quality on the dev mixtures, per condition.
 
 For each speech condition (clean, 20, 10, 5, 0 dB SNR): frame precision,

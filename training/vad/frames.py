@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """Frame data from the pipeline's dumps: the feature rows the detector saw,
 spliced exactly as the network sees them, with the mixtures' labels."""
 import os

@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """The cepstral mean table, and the seed model used to compute it.
 
 The table is the starting point of the detector's running mean and variance

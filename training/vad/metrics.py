@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """Frame-level detection measures shared by training and evaluation."""
 import numpy as np
 

@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """Mixtures for training and evaluating the detector, with 10 ms frame labels.
 
 A speech mixture is a row of utterances of one split, separated by pauses of

@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """Readers and writers of the detector's three model files.
 
 quellan_data_a: uint32 N, then N float32 means and N float32 variances: the

@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """The detector's network in numpy: logistic hidden layers and a two-class
 softmax, trained with cross-entropy and Adam; and the forward pass as the
 detector computes its frame score."""

@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """Trains the detector's network on frames the pipeline itself produced.
 
 Inputs are the dumps of `kvasr vad --dump` over the train and val mixtures

@@ -1,4 +1,5 @@
 #!/bin/bash
+# SPDX-License-Identifier: Apache-2.0
 # Reproduces the shipped VAD model (models/vad/quellan_data_{a,b,c}) from the
 # shared corpus and the Debian packages of training/vad/packages.py, and
 # evaluates it on the dev mixtures: the new ones (held-out packages and

@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """Chooses the class priors written to quellan_data_c.
 
 The detector calls a frame speech when its smoothed, prior-divided log

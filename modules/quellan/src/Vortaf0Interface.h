@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Tone features for the voice activity pipeline: frames a 16 kHz stream into
 // 10 ms frames, runs the pitch tracker on them and writes the delayed,
 // scaled tone values into the caller's frame-major feature matrix.

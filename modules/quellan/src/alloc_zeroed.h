@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The module's buffers: zeroed, and null rather than an exception when memory
 // runs out, so that each constructor names the buffer in its warning line
 // (with its own file, line and function) before it gives up.

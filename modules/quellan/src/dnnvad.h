@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Frame-level speech detector: network scores smoothed over time, gated by
 // frame energy, turned into segments with a head margin, a minimum closing
 // silence and cut points in the middle of that silence.

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Pitch tracker frame driver: per 10 ms frame of 16 kHz PCM, a silence test,
 // 2:1 decimation into a sliding 8 kHz analysis buffer, the windowed spectrum,
 // frame energy and mel energies, the voicing decision and the pitch estimate,

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Pitch estimate of one analysed frame: harmonic salience on the spectrum for
 // candidates, normalised cross-correlation of the 2 kHz low-pass signal to
 // weigh them, frame-to-frame continuity, then a refinement from the

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Perceptual linear prediction front end: 16 kHz samples to cepstra with C0,
 // two derivative blocks and mean/variance normalisation.
 #ifndef QUELLAN_PLP_H_

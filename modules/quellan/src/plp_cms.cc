@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Taking over the PLP settings, and the running mean and variance
 // normalisation seeded from the cepstral mean table.
 #include <cmath>

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Settings of the PLP front end. All values are built-in defaults; the model
 // directory only locates the cepstral mean table.
 #ifndef QUELLAN_PLP_CONFIG_H_

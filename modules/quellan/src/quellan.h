@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Voice activity pipeline: buffers a stream of 16 kHz chunks, turns them into
 // PLP rows, lets the detector find speech intervals and copies the matching
 // audio out.

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Configuration of the voice activity module: built-in defaults, with the
 // model directory locating the three data files.
 #ifndef QUELLAN_QUELLAN_CONF_H_

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // One-line warnings of the voice activity module, written to standard output.
 #ifndef QUELLAN_LOG_H_
 #define QUELLAN_LOG_H_

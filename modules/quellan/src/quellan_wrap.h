@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 /*
  * Voice activity module: the four entry points through which the engine's
  * speech segment buffer drives the detector. The handle is opaque.

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Spectrum of a real frame by an iterative radix-2 FFT.
 #ifndef QUELLAN_REAL_FFT_H_
 #define QUELLAN_REAL_FFT_H_

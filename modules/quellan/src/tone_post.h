@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Turns the per-frame pitch track into delayed, speaker-normalised log-pitch
 // contours with three derivatives (four floats per 10 ms frame).
 #ifndef QUELLAN_TONE_POST_H_

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Feed-forward network that scores spliced feature windows as speech or
 // non-speech, read from a flagged binary file and a class-prior file.
 #ifndef QUELLAN_VAD_DNN_H_

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Speech/noise decision, low/high balance and 2 kHz low-pass signal for the
 // pitch tracker, one call each per analysed frame.
 #ifndef QUELLAN_VOICING_DETECTOR_H_

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 /*
  * Values that the kvasr decoder library (libkvasr_decoder.so) passes through
  * the generic decoder interface of kvasr_decoder_api.h. Hosts need them only

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The model manifest: a small versioned text file naming the recogniser's
 // model files. The format is described in platform/decoder/README.md.
 #ifndef KVASR_PLATFORM_DECODER_MANIFEST_H_

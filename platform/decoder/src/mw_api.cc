@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The C entry points: argument checks and the C++/C boundary. Behaviour is
 // documented in platform/decoder/README.md.
 #include <exception>

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // One streaming recogniser instance over PocketSphinx: utterances, partial
 // and final results, and speech-end detection. What the handle of the mw*
 // functions points to.

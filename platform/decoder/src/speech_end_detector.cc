@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 #include "speech_end_detector.h"
 
 #include "kvasr_decoder_constants.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Turns the recogniser front end's running speech/silence state into the
 // speech-end events of one utterance, with two time limits.
 #ifndef KVASR_PLATFORM_DECODER_SPEECH_END_DETECTOR_H_

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The three C functions the engine's punctuation adapter calls.
 #include <exception>
 #include <iostream>

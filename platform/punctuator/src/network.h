@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The punctuation and casing network: word and subword embeddings, dilated
 // convolutions, an optional bidirectional GRU and two linear heads. Weights
 // come from the model file (format in ../README.md).

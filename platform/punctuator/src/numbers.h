@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Spelled numbers to digits where a reader expects digits ("twenty three" ->
 // "23", "nineteen ninety five" -> "1995", "three point five" -> "3.5"), from
 // the word table of the num file and the fixed phrases of the xdb file.

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // One loaded model and the buffers of one text: words in, network windows,
 // marks and casing, spelled numbers to digits, text out.
 #ifndef KVASR_PUNCTUATOR_PUNCTUATOR_H_

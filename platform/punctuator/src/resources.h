@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The text files of a punctuation model: vocabulary, label set, subword
 // merges and casing lexicon (formats in ../README.md).
 #ifndef KVASR_PUNCTUATOR_RESOURCES_H_
