@@ -107,21 +107,27 @@ def noisy_recordings(clips, package_corpus, snr_db, out_dir):
     return paths
 
 
+def command(args, mode):
+    cmd = [args.kvasr, "transcribe", "--no-progress"]
+    if mode == "no-vad":
+        cmd.append("--no-vad")
+    elif args.vad_models:
+        cmd += ["--vad-models", args.vad_models]
+    return cmd
+
+
 def main_noisy(args, refs, clips):
     ref = [w for clip in clips for w in refs[os.path.splitext(os.path.basename(clip))[0]]]
     with tempfile.TemporaryDirectory() as tmp:
         noisy, alone = noisy_recordings(clips, args.noisy, args.snr_db, tmp)
         for mode in ("no-vad", "vad"):
-            cmd = [args.kvasr, "transcribe", "--no-progress"]
-            if mode == "no-vad":
-                cmd.append("--no-vad")
-            elif args.vad_models:
-                cmd += ["--vad-models", args.vad_models]
+            cmd = command(args, mode)
             hyp = transcribe(cmd + [noisy])[0].lower().split()
             stray = transcribe(cmd + [alone])[0].lower().split()
+            errors = edit_distance(ref, hyp)
             print("%s, %g dB: WER %.1f %% (%d / %d words); %d words in the background alone: %s"
-                  % (mode, args.snr_db, 100.0 * edit_distance(ref, hyp) / len(ref),
-                     edit_distance(ref, hyp), len(ref), len(stray), " ".join(stray)))
+                  % (mode, args.snr_db, 100.0 * errors / len(ref), errors, len(ref),
+                     len(stray), " ".join(stray)))
 
 
 def main():
@@ -141,11 +147,7 @@ def main():
     for mode in ("no-vad", "vad"):
         errors = words = peak = 0
         for clip in clips:
-            cmd = [args.kvasr, "transcribe", "--no-progress"]
-            if mode == "no-vad":
-                cmd.append("--no-vad")
-            elif args.vad_models:
-                cmd += ["--vad-models", args.vad_models]
+            cmd = command(args, mode)
             text, rss = transcribe(cmd + [clip])
             ref = refs[os.path.splitext(os.path.basename(clip))[0]]
             hyp = text.lower().split()

@@ -54,6 +54,12 @@ class DecoderManifest : public testing::Test {
   const fs::path dir_{tmp_.path()};
 };
 
+void ExpectLoadsQuietly(const InitOutcome& outcome) {
+  EXPECT_NE(outcome.handle, nullptr);
+  EXPECT_EQ(outcome.error_output, "");
+  mwDecoderDestroy(outcome.handle);
+}
+
 void ExpectRejected(const InitOutcome& outcome, const std::string& fragment) {
   EXPECT_EQ(outcome.handle, nullptr);
   mwDecoderDestroy(outcome.handle);
@@ -67,10 +73,7 @@ TEST_F(DecoderManifest, ValidManifestsLoadQuietly) {
   for (const std::string& text :
        {kValid, "kvasr-decoder-manifest 1\r\n# comment\r\n\r\n  " + kAcousticModel + kDictionary +
                     kLanguageModel + "log = off\r\noption.beam = 1e-40\r\n"}) {
-    const InitOutcome outcome = InitFromPath(Write(text));
-    EXPECT_NE(outcome.handle, nullptr);
-    EXPECT_EQ(outcome.error_output, "");
-    mwDecoderDestroy(outcome.handle);
+    ExpectLoadsQuietly(InitFromPath(Write(text)));
   }
 }
 
@@ -174,10 +177,7 @@ TEST_F(DecoderManifestBase, AManifestTakesWhatItDoesNotNameFromItsBase) {
         // The base's own relative paths are its folder's, not the child's.
         kTag + "base = " + (dir_ / "base.manifest").string() + "\n" + kLanguageModel}) {
     SCOPED_TRACE(text);
-    const InitOutcome outcome = InitFromPath(Write(text));
-    EXPECT_NE(outcome.handle, nullptr);
-    EXPECT_EQ(outcome.error_output, "");
-    mwDecoderDestroy(outcome.handle);
+    ExpectLoadsQuietly(InitFromPath(Write(text)));
   }
 }
 

@@ -8,7 +8,6 @@ package, as `packages.PACKAGES` assigns them, so that dev and val hold sound
 from sources the network never heard. `dev` is for the final figures only;
 `val` chooses the network size, when training stops and the operating point.
 """
-import csv
 import os
 import random
 
@@ -40,8 +39,7 @@ def category(row):
 
 
 def read_manifest(corpus_dir):
-    with open(os.path.join(corpus_dir, "MANIFEST.tsv"), encoding="utf-8") as f:
-        rows = list(csv.DictReader(f, delimiter="\t"))
+    rows = packages.read_manifest(corpus_dir)
     for row in rows:
         row["category"] = category(row)
         row["duration_s"] = float(row["duration_s"])

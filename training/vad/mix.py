@@ -234,7 +234,7 @@ def main():
     # Babble holds unintelligible voices: a background under speech, never a
     # speech-free stretch whose every frame must be rejected.
     plain_noise = [r for r in noise if r["kind"] == "noise" and r["category"] != "babble"
-                   and r not in effects]
+                   and not r["category"].startswith("effects/")]
     nospeech_kinds = [("music", music), ("noise", plain_noise)]
     if effects:
         nospeech_kinds.append(("effects", effects))

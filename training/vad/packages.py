@@ -186,6 +186,16 @@ def candidates(cache):
     return keep, excluded
 
 
+def ffmpeg(src, out, skip_s, max_s):
+    """Decodes at most max_s seconds of src, from skip_s on, to 16 kHz mono
+    16-bit WAV; whether a file came out."""
+    cmd = ["ffmpeg", "-nostdin", "-v", "error", "-y"]
+    if skip_s:
+        cmd += ["-ss", str(skip_s)]
+    cmd += ["-i", src, "-ac", "1", "-ar", str(RATE_HZ), "-sample_fmt", "s16", "-t", str(max_s), out]
+    return subprocess.run(cmd, capture_output=True).returncode == 0 and os.path.exists(out)
+
+
 def decode_one(cache, pkg, rel, kind):
     src = os.path.join(cache, "root", pkg, rel)
     # Names are made plain ASCII; the hash keeps apart those that were not.
@@ -193,18 +203,13 @@ def decode_one(cache, pkg, rel, kind):
     out_rel = "%s/%s-%s.wav" % (pkg, hashlib.sha1(rel.encode()).hexdigest()[:8], plain)
     out = os.path.join(cache, "corpus", out_rel)
     os.makedirs(os.path.dirname(out), exist_ok=True)
-    cmd = ["ffmpeg", "-nostdin", "-v", "error", "-y"]
-    if kind == "music":
-        cmd += ["-ss", str(MUSIC_SKIP_S)]
-    cmd += ["-i", src, "-ac", "1", "-ar", str(RATE_HZ), "-sample_fmt", "s16"]
-    cmd += ["-t", str(MUSIC_EXCERPT_S if kind == "music" else EFFECT_MAX_S), out]
-    if subprocess.run(cmd, capture_output=True).returncode != 0 or not os.path.exists(out):
+    max_s = MUSIC_EXCERPT_S if kind == "music" else EFFECT_MAX_S
+    if not ffmpeg(src, out, MUSIC_SKIP_S if kind == "music" else 0, max_s):
         return None, "not decodable"
     x, _ = soundfile.read(out, dtype="float64")
     if kind == "music" and len(x) < MIN_DURATION_S * RATE_HZ:
         # A short track: take it from the start.
-        subprocess.run([c for c in cmd if c not in ("-ss", str(MUSIC_SKIP_S))],
-                       capture_output=True)
+        ffmpeg(src, out, 0, max_s)
         x, _ = soundfile.read(out, dtype="float64")
     if x.ndim != 1 or len(x) < MIN_DURATION_S * RATE_HZ:
         os.remove(out)
@@ -265,6 +270,11 @@ def decode(cache):
     print("%d files decoded, %d left out" % (len(rows), len(excluded)))
 
 
+def read_manifest(corpus_dir):
+    with open(os.path.join(corpus_dir, "MANIFEST.tsv"), encoding="utf-8") as f:
+        return list(csv.DictReader(f, delimiter="\t"))
+
+
 def write_manifest(corpus_dir, rows):
     with open(os.path.join(corpus_dir, "MANIFEST.tsv"), "w", encoding="utf-8") as f:
         w = csv.DictWriter(f, MANIFEST_COLUMNS, delimiter="\t", lineterminator="\n")
@@ -292,8 +302,7 @@ def audit(cache, silero_model):
     """Drops the non-speech files in which Silero VAD hears a voice (run by
     bench/silero_probs.js; NODE_PATH must name its node_modules)."""
     corpus_dir = os.path.join(cache, "corpus")
-    with open(os.path.join(corpus_dir, "MANIFEST.tsv"), encoding="utf-8") as f:
-        rows = list(csv.DictReader(f, delimiter="\t"))
+    rows = read_manifest(corpus_dir)
     links, probs_dir = os.path.join(cache, "audit", "links"), os.path.join(cache, "audit", "probs")
     os.makedirs(links, exist_ok=True)
     os.makedirs(probs_dir, exist_ok=True)
@@ -334,8 +343,7 @@ def summary(cache):
     """A Markdown table of what each package gave: split, files and minutes
     by kind, version and licence."""
     corpus_dir = os.path.join(cache, "corpus")
-    with open(os.path.join(corpus_dir, "MANIFEST.tsv"), encoding="utf-8") as f:
-        rows = list(csv.DictReader(f, delimiter="\t"))
+    rows = read_manifest(corpus_dir)
     print("| package | version | part | music | effects | speech | licence |")
     print("|---|---|---|---:|---:|---:|---|")
     for pkg in sorted(PACKAGES, key=lambda p: (PACKAGES[p][1], p)):
