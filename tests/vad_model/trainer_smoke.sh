@@ -66,10 +66,34 @@ cases = {
 for (pkg, rel), kind in cases.items():
     assert packages.classify(pkg, rel)[0] == kind, (pkg, rel, packages.classify(pkg, rel))
 EOF_FIXTURE
-for part in train val; do
-  "$python" "$training/mix.py" --corpus "$corpus" --packages packages --part $part \
-    --out mix/$part --speech-mixtures 1 --nospeech-mixtures 1 --seconds 6
-done
+"$python" "$training/mix.py" --corpus "$corpus" --packages packages --part train \
+  --out mix/train --speech-mixtures 1 --nospeech-mixtures 1 --seconds 6 --augment
+"$python" "$training/mix.py" --corpus "$corpus" --packages packages --part val \
+  --out mix/val --speech-mixtures 1 --nospeech-mixtures 1 --seconds 6
+# Augmentation moves a tone by the speed factor, and a speed-up drops what
+# would pass the Nyquist frequency instead of folding it back.
+PYTHONPATH=$training "$python" -c "
+import random, numpy as np, mix
+rng = random.Random(11)
+t = np.arange(32000) / 16000
+def peak_hz(y):
+    return np.fft.rfftfreq(len(y), 1 / 16000)[np.abs(np.fft.rfft(y)).argmax()]
+dropped = 0
+for _ in range(40):
+    low, high = np.sin(2 * np.pi * 500 * t), np.sin(2 * np.pi * 7000 * t)
+    state = rng.getstate()
+    y = mix.augment(low, rng)
+    factor = len(low) / len(y)
+    assert 0.79 <= factor <= 1.26 and abs(peak_hz(y) - 500 * factor) < 2, (factor, peak_hz(y))
+    rng.setstate(state)
+    z = mix.augment(high, rng)
+    if 7000 * factor > 8000:
+        assert np.sqrt(np.mean(z ** 2)) < 1e-3, (factor, peak_hz(z))
+        dropped += 1
+    else:
+        assert abs(peak_hz(z) - 7000 * factor) < 2, (factor, peak_hz(z))
+assert dropped > 0
+"
 grep -q "^train_effects_000	effects	" mix/train/mixtures.tsv || { cat mix/train/mixtures.tsv; exit 1; }
 "$python" "$training/mean_table.py" seed seed
 mkdir -p pass1
@@ -124,6 +148,21 @@ rows=$(ls dump/val/*.f32 | head -n 1)
 "$python" "$training/train.py" --mix mix --dump dump --table table/quellan_data_a \
   --out tuned --hidden 8,4 --init model --loss decision --max-steps 3 --batch 2 > tuned.txt
 cmp -s model/quellan_data_b tuned/quellan_data_b && { echo "fine-tuning changed nothing"; exit 1; }
+# Two networks merged into one score the mean of their scores, in the trainer
+# and in the module.
+"$python" "$training/ensemble.py" --out merged model tuned > /dev/null
+PYTHONPATH=$training "$python" - "$rows" <<'EOF_MERGED'
+import sys
+import numpy as np, frames, model_io, network
+rows = np.fromfile(sys.argv[1], dtype="<f4").reshape(-1, frames.FEAT_DIM)
+x = rows[frames.splice_index(len(rows))].reshape(len(rows), -1)
+def scores(model, priors=(0.5, 0.5)):
+    return network.detector_scores(*model_io.read_network(model + "/quellan_data_b"), priors, x)
+mean = (scores("model") + scores("tuned")) / 2
+assert np.abs(scores("merged") - mean).max() < 1e-4, np.abs(scores("merged") - mean).max()
+scores("merged", model_io.read_priors("merged/quellan_data_c")).astype("<f4").tofile("merged.f32")
+EOF_MERGED
+"$python" "$here/forward_check.py" trained "$forward_tool" merged "$rows" merged.f32
 before=$(od -An -tx1 model/quellan_data_c)
 "$python" "$training/tune_priors.py" --kvasr "$kvasr" --model model --mix mix/val \
   --work priors --thresholds -1 1 > priors.txt

@@ -15,6 +15,12 @@ come from the speech before mixing and never see the background.
 `--label-range-db` relabels the same audio with another range, to see how
 the figures depend on the rule.
 
+Augmentation (`--augment`, training mixtures only): most drawings of a
+background or speech-free file are played at another speed (pitch and tempo
+together) and through a random spectral tilt and peak, so that the network
+meets timbres that no recording gave it. Speech is never altered: its labels
+come from it.
+
 Levels: the active level of an utterance is the RMS over its speech frames.
 A mixture draws one speech level in dBFS (quiet speakers near the detector's
 50 dB energy gate up to loud ones), each utterance varies around it by up to
@@ -44,6 +50,13 @@ DITHER_RMS = (2.0, 12.0)  # 16-bit steps: a microphone floor, not digital zero
 SNRS_DB = (None, 20.0, 10.0, 5.0, 0.0)  # None: clean
 FULL_SCALE = 32768.0
 PEAK_LIMIT = 32000.0
+AUGMENT_SHARE = 2.0 / 3.0  # the rest stays as recorded, the timbres users meet
+AUGMENT_RATE_FACTOR = (0.8, 1.25)  # about a major third down or up
+AUGMENT_TILT_DB_PER_OCTAVE = 3.0
+AUGMENT_PEAK_DB = 10.0
+AUGMENT_PEAK_OCTAVES = (-3.0, 3.0)  # centre, relative to 1 kHz
+AUGMENT_PEAK_WIDTH_OCTAVES = (0.3, 1.0)
+AUGMENT_TILT_FLOOR_HZ = 50.0  # below this the tilt stays flat
 
 
 def frame_count(samples):
@@ -77,9 +90,31 @@ def db_to_amp(db):
     return 10.0 ** (db / 20.0)
 
 
+def augment(x, rng):
+    """x resampled by a random factor and coloured by a random tilt and peak,
+    both in one spectrum: truncating it band-limits a speed-up, and a
+    slow-down leaves the top band empty as a duller recording would."""
+    factor = math.exp(rng.uniform(*np.log(AUGMENT_RATE_FACTOR)))
+    n = max(WINDOW_SAMPLES, int(round(len(x) / factor)))
+    spectrum = np.fft.rfft(x)
+    out = np.zeros(n // 2 + 1, dtype=complex)
+    kept = min(len(out), len(spectrum))
+    out[:kept] = spectrum[:kept]
+    octaves = np.log2(np.maximum(np.fft.rfftfreq(n, 1.0 / RATE_HZ),
+                                 AUGMENT_TILT_FLOOR_HZ) / 1000.0)
+    centre = rng.uniform(*AUGMENT_PEAK_OCTAVES)
+    width = rng.uniform(*AUGMENT_PEAK_WIDTH_OCTAVES)
+    gain_db = (rng.uniform(-1, 1) * AUGMENT_TILT_DB_PER_OCTAVE * octaves
+               + rng.uniform(-1, 1) * AUGMENT_PEAK_DB
+               * np.exp(-0.5 * ((octaves - centre) / width) ** 2))
+    out *= db_to_amp(gain_db)
+    return np.fft.irfft(out, n) * (n / len(x))
+
+
 class Audio:
-    def __init__(self):
+    def __init__(self, augmented=False):
         self.cache = {}
+        self.augmented = augmented
 
     def load(self, row):
         path = row["file"]
@@ -88,6 +123,13 @@ class Audio:
             assert rate == RATE_HZ and x.ndim == 1, path
             self.cache[path] = x * FULL_SCALE
         return self.cache[path]
+
+    def load_nonspeech(self, row, rng):
+        """A background or speech-free file, augmented when asked for."""
+        x = self.load(row)
+        if self.augmented and rng.random() < AUGMENT_SHARE:
+            return augment(x, rng)
+        return x
 
 
 def active_rms(x):
@@ -109,7 +151,7 @@ def pick(rows, rng):
 def background(audio, rows, length, rng):
     """`length` samples of one background file, looped from a random start."""
     row = pick(rows, rng)
-    x = audio.load(row)
+    x = audio.load_nonspeech(row, rng)
     start = rng.randrange(len(x))
     reps = (start + length) // len(x) + 1
     return np.tile(x, reps)[start:start + length], row
@@ -183,7 +225,7 @@ def nospeech_mixture(audio, rows, target_s, kind, rng):
         parts, names, total = [], [], 0
         while total < length:
             row = pick(rows, rng)
-            clip = audio.load(row)
+            clip = audio.load_nonspeech(row, rng)
             rms = math.sqrt(max(np.mean(clip ** 2), 1e-9))
             parts.append(clip * db_to_amp(level_db) * FULL_SCALE / rms)
             names.append(row["path"])
@@ -224,6 +266,8 @@ def main():
     ap.add_argument("--label-range-db", type=float, default=LABEL_RANGE_DB,
                     help="label rule's range below the utterance's loudest frame; only the "
                          "labels change, the audio and its levels do not")
+    ap.add_argument("--augment", action="store_true",
+                    help="resample and colour the backgrounds and speech-free files")
     args = ap.parse_args()
 
     rows = corpus.load(args.corpus, args.packages)[args.part]
@@ -240,7 +284,7 @@ def main():
         nospeech_kinds.append(("effects", effects))
     nospeech_kinds.append(("silence", None))
     rng = random.Random(args.seed * 7919 + ("train", "val", "dev").index(args.part))
-    audio = Audio()
+    audio = Audio(args.augment)
     os.makedirs(args.out, exist_ok=True)
     with open(os.path.join(args.out, "mixtures.tsv"), "w") as index:
         index.write("name\tkind\tcondition\tlevel_dbfs\tseconds\tbackground\n")

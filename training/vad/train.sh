@@ -12,9 +12,11 @@
 # PACKAGE_CACHE (default ~/.cache/kvasr-vad-packages, about 9 GB) holds the
 # downloaded packages, their decoded excerpts and Silero VAD (from npm) that
 # audits them; nothing there needs root. Set KVASR to use an existing kvasr
-# binary; otherwise one is built in build-vadtrain/. Set HIDDEN (e.g.
-# "64 128") to compare sizes; the first is shipped. About 25 minutes on two
-# cores, plus the first download and decoding (15 minutes). Needs the
+# binary; otherwise one is built in build-vadtrain/. The shipped network
+# is the mean of networks of HIDDEN (default 64) logistic units trained
+# alike from SEEDS (default "1 2"), merged into one by ensemble.py.
+# About 30 minutes on two cores, plus the first download and decoding
+# (15 minutes). Needs the
 # training packages: `bash scripts/setup-deps.sh train` (Debian's
 # python3-numpy, python3-soundfile, ffmpeg, nodejs and npm).
 set -euo pipefail
@@ -24,7 +26,8 @@ corpus=${1:-$repo/../shared/data/vad}
 work=${2:-/tmp/kvasr-vad-train}
 cache=${PACKAGE_CACHE:-$HOME/.cache/kvasr-vad-packages}
 python=/usr/bin/python3
-hidden=(${HIDDEN:-64})
+hidden=${HIDDEN:-64}
+seeds=(${SEEDS:-1 2})
 # One BLAS thread keeps training deterministic and the machine usable.
 export OMP_NUM_THREADS=1 OPENBLAS_NUM_THREADS=1
 
@@ -53,18 +56,19 @@ fi
 mkdir -p "$work"
 cd "$work"
 echo "== mixtures"
-for counts in "train 200 240" "val 10 10" "dev 20 20"; do
+# Only the training mixtures are augmented: val and dev stay as recorded.
+for counts in "train 200 240 --augment" "val 10 10" "dev 20 20"; do
   set -- $counts
   rm -rf "mix/$1"
   "$python" "$here/mix.py" --corpus "$corpus" --packages "$cache/corpus" --part "$1" \
-    --out "mix/$1" --speech-mixtures "$2" --nospeech-mixtures "$3"
+    --out "mix/$1" --speech-mixtures "$2" --nospeech-mixtures "$3" ${4:-}
 done
 rm -rf mix/dev-shared
 "$python" "$here/mix.py" --corpus "$corpus" --part dev --out mix/dev-shared \
   --speech-mixtures 20 --nospeech-mixtures 10
 
 echo "== mean table (first pass over the training mixtures)"
-rm -rf seed pass1 table dump frame-model model priors eval eval-shared
+rm -rf seed pass1 table dump run* model priors eval eval-shared
 "$python" "$here/mean_table.py" seed seed
 mkdir -p pass1 table
 "$KVASR" vad --vad-models seed --dump pass1 mix/train/*.wav > /dev/null
@@ -77,16 +81,32 @@ for part in train val; do
   "$KVASR" vad --vad-models table --dump "dump/$part" "mix/$part"/*.wav > /dev/null
 done
 
-echo "== training"
-args=()
-for h in "${hidden[@]}"; do args+=(--hidden "$h"); done
-"$python" "$here/train.py" --mix mix --dump dump --table table/quellan_data_a \
-  --out frame-model "${args[@]}" --epochs 20 --lr-decay 0.88 --nospeech-weight 3 \
-  --report training.json
-echo "== fine-tuning through the detector's smoothing and energy gate"
-"$python" "$here/train.py" --mix mix --dump dump --table table/quellan_data_a \
-  --out model --hidden "${hidden[0]}" --init frame-model --loss decision --batch 4 \
-  --epochs 6 --lr 5e-4 --lr-decay 0.85 --nospeech-weight 10 --report fine-tuning.json
+echo "== training: one network per seed, ${#seeds[@]} seeds, two at a time"
+train_seed() {
+  "$python" "$here/train.py" --mix mix --dump dump --table table/quellan_data_a \
+    --out "run$1/frame-model" --hidden "$hidden" --seed "$1" --epochs 20 --lr-decay 0.88 \
+    --nospeech-weight 3 --report "run$1/training.json"
+  # Then through the detector's smoothing and energy gate.
+  "$python" "$here/train.py" --mix mix --dump dump --table table/quellan_data_a \
+    --out "run$1/model" --hidden "$hidden" --seed "$1" --init "run$1/frame-model" \
+    --loss decision --batch 4 --epochs 6 --lr 5e-4 --lr-decay 0.85 --nospeech-weight 10 \
+    --report "run$1/fine-tuning.json"
+}
+pids=()
+for s in "${seeds[@]}"; do
+  mkdir -p "run$s"
+  train_seed "$s" > "run$s/log.txt" 2>&1 &
+  pids+=($!)
+  if [ ${#pids[@]} -ge 2 ]; then wait "${pids[0]}"; pids=("${pids[@]:1}"); fi
+done
+for p in "${pids[@]}"; do wait "$p"; done
+for s in "${seeds[@]}"; do
+  grep -A1 '^hidden' "run$s/log.txt" | tail -n 1 |
+    awk -v s="$s" '{print "seed " s ": val accuracy " $2 ", AUC " $3 ", decision F1 " $4}'
+done
+models=()
+for s in "${seeds[@]}"; do models+=("run$s/model"); done
+"$python" "$here/ensemble.py" --out model "${models[@]}"
 
 echo "== class priors (the detector's operating point, chosen on val)"
 "$python" "$here/tune_priors.py" --kvasr "$KVASR" --model model --mix mix/val --work priors

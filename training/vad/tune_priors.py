@@ -35,6 +35,9 @@ F1_TIE = 0.001
 # stretches every false decision over about three times as many frames, so
 # these sit well below what a recogniser can bear inside segments.
 FALSE_ALARM_LIMITS = {"music": 0.015, "effects": 0.015, "noise": 0.005, "silence": 0.005}
+# Quarter steps where the limits usually bind: between half steps the music
+# false alarms change by half, too coarse a choice.
+THRESHOLDS = [t / 4.0 for t in range(-8, 5)] + [1.5, 2.0, 3.0]
 
 
 def priors_for(threshold_logit):
@@ -72,8 +75,7 @@ def main():
                     help="folder with quellan_data_a and _b; its quellan_data_c is rewritten")
     ap.add_argument("--mix", required=True, help="val mixtures folder")
     ap.add_argument("--work", required=True)
-    ap.add_argument("--thresholds", type=float, nargs="+",
-                    default=[-2.0, -1.5, -1.0, -0.5, 0.0, 0.5, 1.0, 1.5, 2.0, 3.0])
+    ap.add_argument("--thresholds", type=float, nargs="+", default=THRESHOLDS)
     args = ap.parse_args()
     kinds = [k for k in FALSE_ALARM_LIMITS]
     print("threshold log-odds\tmean decision F1\t" +
