@@ -16,9 +16,8 @@
 # is the mean of networks of HIDDEN (default 64) logistic units trained
 # alike from SEEDS (default "1 2"), merged into one by ensemble.py.
 # About 30 minutes on two cores, plus the first download and decoding
-# (15 minutes). Needs the
-# training packages: `bash scripts/setup-deps.sh train` (Debian's
-# python3-numpy, python3-soundfile, ffmpeg, nodejs and npm).
+# (15 minutes). Needs the training packages: `bash scripts/setup-deps.sh
+# train` (Debian's python3-numpy, python3-soundfile, ffmpeg, nodejs and npm).
 set -euo pipefail
 here=$(cd "$(dirname "$0")" && pwd)
 repo=$(cd "$here/../.." && pwd)
@@ -92,9 +91,10 @@ train_seed() {
     --loss decision --batch 4 --epochs 6 --lr 5e-4 --lr-decay 0.85 --nospeech-weight 10 \
     --report "run$1/fine-tuning.json"
 }
-pids=()
+pids=() models=()
 for s in "${seeds[@]}"; do
   mkdir -p "run$s"
+  models+=("run$s/model")
   train_seed "$s" > "run$s/log.txt" 2>&1 &
   pids+=($!)
   if [ ${#pids[@]} -ge 2 ]; then wait "${pids[0]}"; pids=("${pids[@]:1}"); fi
@@ -104,8 +104,6 @@ for s in "${seeds[@]}"; do
   grep -A1 '^hidden' "run$s/log.txt" | tail -n 1 |
     awk -v s="$s" '{print "seed " s ": val accuracy " $2 ", AUC " $3 ", decision F1 " $4}'
 done
-models=()
-for s in "${seeds[@]}"; do models+=("run$s/model"); done
 "$python" "$here/ensemble.py" --out model "${models[@]}"
 
 echo "== class priors (the detector's operating point, chosen on val)"
