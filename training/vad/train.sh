@@ -92,6 +92,14 @@ train_seed() {
     --report "run$1/fine-tuning.json"
 }
 pids=() models=()
+# A seed that fails stops the recipe, and the seed training beside it too.
+stop_seeds() {
+  for p in "${pids[@]}"; do
+    pkill -P "$p" 2> /dev/null || true
+    kill "$p" 2> /dev/null || true
+  done
+}
+trap stop_seeds EXIT
 for s in "${seeds[@]}"; do
   mkdir -p "run$s"
   models+=("run$s/model")
@@ -100,6 +108,7 @@ for s in "${seeds[@]}"; do
   if [ ${#pids[@]} -ge 2 ]; then wait "${pids[0]}"; pids=("${pids[@]:1}"); fi
 done
 for p in "${pids[@]}"; do wait "$p"; done
+trap - EXIT
 for s in "${seeds[@]}"; do
   grep -A1 '^hidden' "run$s/log.txt" | tail -n 1 |
     awk -v s="$s" '{print "seed " s ": val accuracy " $2 ", AUC " $3 ", decision F1 " $4}'
